@@ -1,0 +1,23 @@
+#include "platform/ticks.h"
+
+#include <sys/syscall.h>
+#include <time.h>
+#include <unistd.h>
+
+ULONGLONG GetTickCount64() {
+    timespec ts{};
+    clock_gettime(CLOCK_MONOTONIC, &ts);
+    return static_cast<ULONGLONG>(ts.tv_sec) * 1000u + static_cast<ULONGLONG>(ts.tv_nsec) / 1000000u;
+}
+
+DWORD GetTickCount() { return static_cast<DWORD>(GetTickCount64()); }
+
+void Sleep(DWORD milliseconds) {
+    timespec ts{static_cast<time_t>(milliseconds / 1000), static_cast<long>(milliseconds % 1000) * 1000000L};
+    while (nanosleep(&ts, &ts) != 0) {
+    }
+}
+
+DWORD GetCurrentThreadId() { return static_cast<DWORD>(syscall(SYS_gettid)); }
+
+DWORD GetCurrentProcessId() { return static_cast<DWORD>(getpid()); }

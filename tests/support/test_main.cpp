@@ -1,0 +1,10 @@
+// Test main shared by every test program: the Qt application object must exist
+// before any message window or timer is used.
+#include <QCoreApplication>
+#include <gtest/gtest.h>
+
+int main(int argc, char** argv) {
+    QCoreApplication app(argc, argv);
+    ::testing::InitGoogleTest(&argc, argv);
+    return RUN_ALL_TESTS();
+}
