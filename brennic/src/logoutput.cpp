@@ -49,45 +49,51 @@ void AppendTwoDigits(std::string& out, unsigned value) {
 
 void AppendEscaped(std::string& out, std::u16string_view text) {
     static const char kHex[] = "0123456789ABCDEF";
-    for (const char c : Utf16ToUtf8(text)) {
-        const auto byte = static_cast<unsigned char>(c);
-        if (byte >= 0x20 && byte != 0x7F) {
-            out += c;
-            continue;
-        }
-        out += '\\';
-        switch (c) {
-            case '\n': out += 'n'; break;
-            case '\r': out += 'r'; break;
-            case '\t': out += 't'; break;
-            default:
-                out += 'x';
-                out += kHex[byte >> 4];
-                out += kHex[byte & 0xF];
+    const std::string utf8 = Utf16ToUtf8(text);
+    size_t runStart = 0;
+    for (size_t i = 0; i < utf8.size(); ++i) {
+        const auto byte = static_cast<unsigned char>(utf8[i]);
+        if (byte >= 0x20 && byte != 0x7F) continue;
+        out.append(utf8, runStart, i - runStart);
+        runStart = i + 1;
+        switch (byte) {
+            case '\n': out += "\\n"; break;
+            case '\r': out += "\\r"; break;
+            case '\t': out += "\\t"; break;
+            default: {
+                const char escaped[] = {'\\', 'x', kHex[byte >> 4], kHex[byte & 0xF]};
+                out.append(escaped, sizeof escaped);
+            }
         }
     }
+    out.append(utf8, runStart, std::string::npos);
 }
 
-std::string LevelName(BYTE level) {
+void AppendLevelName(std::string& out, BYTE level) {
     switch (level) {
-        case LOG_LEVEL_ERROR: return "ERROR";
-        case LOG_LEVEL_WARNING: return "WARNING";
-        case LOG_LEVEL_DEBUG1: return "DEBUG1";
-        case LOG_LEVEL_DEBUG2: return "DEBUG2";
-        case LOG_LEVEL_DEBUG3: return "DEBUG3";
-        case LOG_LEVEL_DEBUG4: return "DEBUG4";
-        case LOG_LEVEL_TRACE: return "TRACE";
-        case LOG_LEVEL_INFO: return "INFO";
+        case LOG_LEVEL_ERROR: out += "ERROR"; return;
+        case LOG_LEVEL_WARNING: out += "WARNING"; return;
+        case LOG_LEVEL_DEBUG1: out += "DEBUG1"; return;
+        case LOG_LEVEL_DEBUG2: out += "DEBUG2"; return;
+        case LOG_LEVEL_DEBUG3: out += "DEBUG3"; return;
+        case LOG_LEVEL_DEBUG4: out += "DEBUG4"; return;
+        case LOG_LEVEL_TRACE: out += "TRACE"; return;
+        case LOG_LEVEL_INFO: out += "INFO"; return;
         default: {
             static const char kHex[] = "0123456789ABCDEF";
-            return std::string("LEVEL(0x") + kHex[level >> 4] + kHex[level & 0xF] + ")";
+            const char text[] = {'L', 'E', 'V', 'E', 'L', '(', '0', 'x', kHex[level >> 4], kHex[level & 0xF], ')'};
+            out.append(text, sizeof text);
         }
     }
 }
 
-std::string LineFormatter::ModuleName(BYTE index) const {
-    if (index < m_moduleNames.size() && !m_moduleNames[index].empty()) return m_moduleNames[index];
-    return "module" + std::to_string(index);
+void LineFormatter::AppendModuleName(std::string& out, BYTE index) const {
+    if (index < m_moduleNames.size() && !m_moduleNames[index].empty()) {
+        out += m_moduleNames[index];
+    } else {
+        out += "module";
+        out += std::to_string(index);
+    }
 }
 
 void LineFormatter::AppendTime(std::string& out, CLogRec::Clock::time_point time) {
@@ -110,9 +116,9 @@ void LineFormatter::AppendTime(std::string& out, CLogRec::Clock::time_point time
 }
 
 void LineFormatter::AppendBody(std::string& out, const CLogRec& record) const {
-    out += ModuleName(record.GetModuleIndex());
+    AppendModuleName(out, record.GetModuleIndex());
     out += ' ';
-    out += LevelName(record.GetLevel());
+    AppendLevelName(out, record.GetLevel());
     out += " kind=";
     out += std::to_string(record.GetKind());
     bool first = true;

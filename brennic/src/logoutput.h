@@ -16,8 +16,8 @@ namespace brennic {
 // \r, \t or \xHH, invalid surrogates become U+FFFD.
 void AppendEscaped(std::string& out, std::u16string_view text);
 
-// "ERROR", "INFO", ... for a single level bit, else "LEVEL(0xHH)".
-std::string LevelName(BYTE level);
+// Appends "ERROR", "INFO", ... for a single level bit, else "LEVEL(0xHH)".
+void AppendLevelName(std::string& out, BYTE level);
 
 // Builds the lines of records:
 //   2025-03-04 10:11:12.345 PelgradDll ERROR kind=76 field=39: text
@@ -25,8 +25,8 @@ std::string LevelName(BYTE level);
 class LineFormatter {
 public:
     void SetModuleNames(std::vector<std::string> names) { m_moduleNames = std::move(names); }
-    // The module's name, or "module<index>" when the list has none for it.
-    std::string ModuleName(BYTE index) const;
+    // Appends the module's name, or "module<index>" when the list has none for it.
+    void AppendModuleName(std::string& out, BYTE index) const;
     // Local time with milliseconds and a trailing space.
     void AppendTime(std::string& out, CLogRec::Clock::time_point time);
     // Everything after the time, without the line break.

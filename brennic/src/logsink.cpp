@@ -31,6 +31,8 @@ constexpr const char16_t* kLibraryVersion = u"1.0";
 constexpr WORD kLogTextField = 1;
 // A configuration file larger than this is not a configuration file.
 constexpr std::streamsize kMaxConfigBytes = 1 << 20;
+// How long the writer lets records gather after the first one woke it.
+constexpr std::chrono::milliseconds kGatherTime(2);
 // Problems of one configuration file reported before the rest are only counted.
 constexpr size_t kMaxReportedProblems = 20;
 
@@ -417,7 +419,13 @@ void CLogSink::WriterLoop() {
         unsigned long long dropped = 0;
         {
             std::unique_lock lock(q.queueLock);
-            q.writerWake.wait(lock, [&] { return !q.queue.empty() || q.state == Impl::State::Stopping; });
+            const auto stopping = [&] { return q.state == Impl::State::Stopping; };
+            if (q.queue.empty() && !stopping()) {
+                q.writerWake.wait(lock, [&] { return !q.queue.empty() || stopping(); });
+                // Woken by the first record of a burst: let the burst gather, so
+                // that its writers find the queue non-empty and need not wake us.
+                q.writerWake.wait_for(lock, kGatherTime, stopping);
+            }
             if (q.queue.empty()) break;  // stopping, and everything is written
             batch.swap(q.queue);
             std::swap(dropped, q.droppedPending);
