@@ -29,25 +29,27 @@ void BM_RecordWithoutSink(benchmark::State& state) {
 }
 BENCHMARK(BM_RecordWithoutSink);
 
-// Information off: the level test is all that runs.
-void BM_RecordDisabled(benchmark::State& state) {
-    TempFolder folder;
-    auto sink = MakeSink(folder, LOG_LEVEL_ERROR, "10000");
-    sink->ReadCfg();
+// One record of the module on the caller's thread. Argument 0: information
+// off, so the level test is all that runs; 1: information on with the writer
+// running, so the record is built and queued. Thread 0 sets the sink up
+// before the threads start their loops and removes it after they all end.
+void BM_Record(benchmark::State& state) {
+    static std::unique_ptr<TempFolder> folder;
+    static std::unique_ptr<CLogSink> sink;
+    const bool enabled = state.range(0) != 0;
+    if (state.thread_index() == 0) {
+        folder = std::make_unique<TempFolder>();
+        sink = MakeSink(*folder, enabled ? LOG_LEVEL_INFO : LOG_LEVEL_ERROR, "1000000");
+        sink->StartLogging();
+    }
     for (auto _ : state) CModuleLog::LogInfo(kText);
+    if (state.thread_index() == 0) {
+        state.counters["dropped"] = static_cast<double>(sink->GetDroppedCount());
+        sink.reset();
+        folder.reset();
+    }
 }
-BENCHMARK(BM_RecordDisabled);
-
-// Information on, writer running: building the record and queueing it.
-void BM_RecordEnabled(benchmark::State& state) {
-    TempFolder folder;
-    auto sink = MakeSink(folder, LOG_LEVEL_INFO, "1000000");
-    sink->StartLogging();
-    for (auto _ : state) CModuleLog::LogInfo(kText);
-    state.counters["dropped"] = static_cast<double>(sink->GetDroppedCount());
-    sink->Flush();
-}
-BENCHMARK(BM_RecordEnabled)->ThreadRange(1, 2)->UseRealTime();
+BENCHMARK(BM_Record)->ArgName("enabled")->Arg(0)->Arg(1)->ThreadRange(1, 2)->UseRealTime();
 
 // The writer alone: records queued before it starts, timed until all are in the file.
 void BM_WriterToFile(benchmark::State& state) {

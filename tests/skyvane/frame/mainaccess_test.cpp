@@ -8,6 +8,7 @@
 
 #include <gtest/gtest.h>
 
+#include <cstdio>
 #include <cstdlib>
 #include <vector>
 
@@ -143,37 +144,34 @@ TEST_F(MainAccessTest, SinkReportsTheModuleNamesAndCallsTheHooks) {
     EXPECT_EQ(Tail(lines[0]), "PelgradDll ERROR kind=76 field=39: hooked");
 }
 
-TEST_F(MainAccessTest, ErrorsOnlyWhenEntry19IsOne) {
-    UseLevels(1);
-    RecordingMainAccess module;
-    CConfigData context;
-    ASSERT_EQ(module.Init(&context), 1);
-    EXPECT_FALSE(CModuleLog::IsInfoEnabled());
-    CModuleLog::LogError(CString(u"error text"));
-    CModuleLog::LogInfo(CString(u"info text"));
-    CModuleLog::LogError(static_cast<const char16_t*>(nullptr));
-    CModuleLog::LogInfo(u"wide info");
-    module.DllExit(0);
-    const auto lines = LogLines();
-    ASSERT_EQ(lines.size(), 2u);
-    EXPECT_EQ(Tail(lines[0]), "PelgradDll ERROR kind=76 field=39: error text");
-    EXPECT_EQ(Tail(lines[1]), "PelgradDll ERROR kind=76 field=39: ");
-}
-
-TEST_F(MainAccessTest, InformationOnlyWhenEntry19Is128) {
-    UseLevels(128);
-    RecordingMainAccess module;
-    CConfigData context;
-    ASSERT_EQ(module.Init(&context), 1);
-    EXPECT_TRUE(CModuleLog::IsInfoEnabled());
-    CModuleLog::LogError(u"wide error");
-    CModuleLog::LogInfo(CString(u"info text"));
-    CModuleLog::LogInfo(u"wide info");
-    module.DllExit(0);
-    const auto lines = LogLines();
-    ASSERT_EQ(lines.size(), 2u);
-    EXPECT_EQ(Tail(lines[0]), "PelgradDll INFO kind=76 field=49: info text");
-    EXPECT_EQ(Tail(lines[1]), "PelgradDll INFO kind=76 field=49: wide info");
+// Entry 19 of the level table selects errors (1) or information (128); each
+// kind of record is written in both text forms.
+TEST_F(MainAccessTest, Entry19SelectsErrorsOrInformation) {
+    const struct {
+        int entry19;
+        bool infoEnabled;
+        std::vector<std::string> lines;
+    } cases[] = {
+        {LOG_LEVEL_ERROR, false, {"PelgradDll ERROR kind=76 field=39: error text", "PelgradDll ERROR kind=76 field=39: "}},
+        {LOG_LEVEL_INFO, true, {"PelgradDll INFO kind=76 field=49: info text", "PelgradDll INFO kind=76 field=49: wide info"}},
+    };
+    for (const auto& c : cases) {
+        SCOPED_TRACE(c.entry19);
+        std::remove(LogPath().c_str());
+        UseLevels(c.entry19);
+        RecordingMainAccess module;
+        CConfigData context;
+        ASSERT_EQ(module.Init(&context), 1);
+        EXPECT_EQ(CModuleLog::IsInfoEnabled(), c.infoEnabled);
+        CModuleLog::LogError(CString(u"error text"));
+        CModuleLog::LogInfo(CString(u"info text"));
+        CModuleLog::LogError(static_cast<const char16_t*>(nullptr));
+        CModuleLog::LogInfo(u"wide info");
+        module.DllExit(0);
+        std::vector<std::string> lines;
+        for (const std::string& line : LogLines()) lines.push_back(Tail(line));
+        EXPECT_EQ(lines, c.lines);
+    }
 }
 
 TEST_F(MainAccessTest, NothingIsWrittenWithoutACurrentSink) {
