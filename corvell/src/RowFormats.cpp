@@ -1,6 +1,7 @@
 #include "RowFormats.h"
 
 #include "Bond.h"
+#include "Utf.h"
 
 #include <charconv>
 #include <cmath>
@@ -10,40 +11,6 @@
 namespace corvell {
 
 namespace {
-
-// Walks the code points of a UTF-16 text; lone surrogates read as U+FFFD.
-template <typename Sink>
-void ForEachCodePoint(std::u16string_view text, Sink&& sink) {
-    for (std::size_t i = 0; i < text.size(); ++i) {
-        const char16_t c = text[i];
-        if (c >= 0xD800 && c <= 0xDBFF && i + 1 < text.size() && text[i + 1] >= 0xDC00 && text[i + 1] <= 0xDFFF) {
-            sink(0x10000 + ((static_cast<char32_t>(c) - 0xD800) << 10) + (text[i + 1] - 0xDC00));
-            ++i;
-        } else if (c >= 0xD800 && c <= 0xDFFF) {
-            sink(char32_t{0xFFFD});
-        } else {
-            sink(static_cast<char32_t>(c));
-        }
-    }
-}
-
-void PutUtf8(std::string& out, char32_t cp) {
-    if (cp < 0x80) {
-        out.push_back(static_cast<char>(cp));
-    } else if (cp < 0x800) {
-        out.push_back(static_cast<char>(0xC0 | (cp >> 6)));
-        out.push_back(static_cast<char>(0x80 | (cp & 0x3F)));
-    } else if (cp < 0x10000) {
-        out.push_back(static_cast<char>(0xE0 | (cp >> 12)));
-        out.push_back(static_cast<char>(0x80 | ((cp >> 6) & 0x3F)));
-        out.push_back(static_cast<char>(0x80 | (cp & 0x3F)));
-    } else {
-        out.push_back(static_cast<char>(0xF0 | (cp >> 18)));
-        out.push_back(static_cast<char>(0x80 | ((cp >> 12) & 0x3F)));
-        out.push_back(static_cast<char>(0x80 | ((cp >> 6) & 0x3F)));
-        out.push_back(static_cast<char>(0x80 | (cp & 0x3F)));
-    }
-}
 
 void PutJsonString(std::string& out, std::u16string_view text) {
     static constexpr char kHex[] = "0123456789abcdef";

@@ -8,6 +8,7 @@
 #include "Retry.h"
 #include "RowDecoders.h"
 #include "Sas.h"
+#include "Utf.h"
 
 using namespace corvell;
 
@@ -185,4 +186,14 @@ TEST(LogRecords, SecretsAreMaskedEverywhere) {
     logger.infoEnabled = false;
     log.Info("not written");
     EXPECT_EQ(logger.Records().size(), 2u);
+}
+
+TEST(TextConversion, MalformedInputBecomesReplacementCharacters) {
+    EXPECT_EQ(ToUtf8(std::u16string(u"a\xD800" u"b\U0001F600")), "a\xEF\xBF\xBD" "b\xF0\x9F\x98\x80");
+    EXPECT_EQ(ToUtf16("a\xC3\xA9\xF0\x9F\x98\x80"), u"a\u00e9\U0001F600");
+    EXPECT_EQ(ToUtf16("\xFF"), u"\uFFFD");
+    EXPECT_EQ(ToUtf16("\xC0\x80"), u"\uFFFD") << "overlong";
+    EXPECT_EQ(ToUtf16("\xED\xA0\x80"), u"\uFFFD") << "encoded surrogate";
+    EXPECT_EQ(ToUtf16("\xE2\x82"), u"\uFFFD\uFFFD") << "cut short";
+    EXPECT_EQ(View(nullptr), u"");
 }

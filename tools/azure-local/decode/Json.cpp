@@ -1,5 +1,7 @@
 #include "Json.h"
 
+#include <QString>
+
 #include <charconv>
 #include <cmath>
 
@@ -112,24 +114,6 @@ private:
         }
     }
 
-    static void PutUtf8(std::string& out, char32_t cp) {
-        if (cp < 0x80) {
-            out.push_back(static_cast<char>(cp));
-        } else if (cp < 0x800) {
-            out.push_back(static_cast<char>(0xC0 | (cp >> 6)));
-            out.push_back(static_cast<char>(0x80 | (cp & 0x3F)));
-        } else if (cp < 0x10000) {
-            out.push_back(static_cast<char>(0xE0 | (cp >> 12)));
-            out.push_back(static_cast<char>(0x80 | ((cp >> 6) & 0x3F)));
-            out.push_back(static_cast<char>(0x80 | (cp & 0x3F)));
-        } else {
-            out.push_back(static_cast<char>(0xF0 | (cp >> 18)));
-            out.push_back(static_cast<char>(0x80 | ((cp >> 12) & 0x3F)));
-            out.push_back(static_cast<char>(0x80 | ((cp >> 6) & 0x3F)));
-            out.push_back(static_cast<char>(0x80 | (cp & 0x3F)));
-        }
-    }
-
     bool Hex4(char32_t& out) {
         if (m_pos + 4 > m_text.size()) return Fail("short \\u escape");
         out = 0;
@@ -181,7 +165,7 @@ private:
                     } else if (cp >= 0xDC00 && cp <= 0xDFFF) {
                         return Fail("lone surrogate escape");
                     }
-                    PutUtf8(out, cp);
+                    out += QString::fromUcs4(&cp, 1).toStdString();
                     break;
                 }
                 default: return Fail("unknown escape");

@@ -221,26 +221,6 @@ bool ParseIsoTime(std::string_view text, std::int64_t& seconds, unsigned& millis
     return true;
 }
 
-std::string FormatIsoTime(std::int64_t seconds, unsigned milliseconds) {
-    std::int64_t days = seconds / 86400, rest = seconds % 86400;
-    if (rest < 0) rest += 86400, --days;
-    // civil from days
-    days += 719468;
-    const std::int64_t era = (days >= 0 ? days : days - 146096) / 146097;
-    const auto doe = static_cast<unsigned>(days - era * 146097);
-    const unsigned yoe = (doe - doe / 1460 + doe / 36524 - doe / 146096) / 365;
-    const unsigned doy = doe - (365 * yoe + yoe / 4 - yoe / 100);
-    const unsigned mp = (5 * doy + 2) / 153;
-    const unsigned d = doy - (153 * mp + 2) / 5 + 1;
-    const unsigned m = mp < 10 ? mp + 3 : mp - 9;
-    const std::int64_t y = static_cast<std::int64_t>(yoe) + era * 400 + (m <= 2);
-    char buffer[48];
-    std::snprintf(buffer, sizeof buffer, "%04lld-%02u-%02uT%02u:%02u:%02u.%03uZ", static_cast<long long>(y), m, d,
-                  static_cast<unsigned>(rest / 3600), static_cast<unsigned>(rest / 60 % 60),
-                  static_cast<unsigned>(rest % 60), milliseconds);
-    return buffer;
-}
-
 DecodeResult DecodeJsonRows(std::string_view body) {
     std::string error;
     const auto document = ParseJson(body, error);

@@ -38,7 +38,6 @@ DecodeResult DecodeRows(std::string_view format, std::string_view body);
 
 // "YYYY-MM-DDThh:mm:ss.mmmZ" to seconds and milliseconds.
 bool ParseIsoTime(std::string_view text, std::int64_t& seconds, unsigned& milliseconds);
-std::string FormatIsoTime(std::int64_t seconds, unsigned milliseconds);
 
 // One recorded row as a JSON line (without the line feed).
 std::string RowToJsonLine(const DecodedRow& row, std::string_view entity, std::string_view format,
