@@ -51,11 +51,14 @@ Outcome Classify(const HttpResponse& response) {
     if (status == 401) return Outcome::Unauthorized;
     if (status == 413) return Outcome::TooLarge;
     if (status == 403) {
-        // 403 covers both quota and size; only the size case is cured by splitting.
+        // 403 covers both a full entity or quota and an oversized message; only
+        // the latter is cured by splitting.
         const std::string body = Lower(response.body);
-        const bool size = body.find("too large") != std::string::npos ||
-                          body.find("size") != std::string::npos || body.find("exceeds") != std::string::npos;
-        return size && body.find("quota") == std::string::npos ? Outcome::TooLarge : Outcome::Permanent;
+        const bool oversized = body.find("too large") != std::string::npos ||
+                               body.find("message size") != std::string::npos ||
+                               body.find("size limit") != std::string::npos;
+        const bool quota = body.find("quota") != std::string::npos || body.find("entity size") != std::string::npos;
+        return oversized && !quota ? Outcome::TooLarge : Outcome::Permanent;
     }
     switch (status) {
         case 408: case 429: case 500: case 502: case 503: case 504:

@@ -136,6 +136,9 @@ TEST(Answers, Classification) {
     EXPECT_EQ(status(413), Outcome::TooLarge);
     EXPECT_EQ(status(403, "<Detail>The message size exceeds the limit</Detail>"), Outcome::TooLarge);
     EXPECT_EQ(status(403, "<Detail>Quota exceeded for this entity</Detail>"), Outcome::Permanent);
+    EXPECT_EQ(status(403, "<Detail>The maximum entity size has been reached or exceeded</Detail>"), Outcome::Permanent);
+    EXPECT_EQ(status(403, "<Detail>The request body is too large</Detail>"), Outcome::TooLarge);
+    EXPECT_EQ(status(403), Outcome::Permanent);
     for (long transient : {408L, 429L, 500L, 502L, 503L, 504L}) EXPECT_EQ(status(transient), Outcome::Transient);
     HttpResponse refused;
     refused.curlCode = 7;  // could not connect
