@@ -1,0 +1,79 @@
+#pragma once
+// Batches of rows for one Service Bus queue or Event Hub at a time, sent over
+// HTTPS with SAS tokens, size limits and bounded retries.
+
+#include <chrono>
+#include <cstdint>
+#include <map>
+#include <memory>
+#include <optional>
+#include <string>
+
+#include "ConnectionString.h"
+#include "Http.h"
+#include "Log.h"
+#include "Retry.h"
+#include "RowFormats.h"
+
+namespace corvell {
+
+struct ClientOptions {
+    // Everything one SendOnlineRows may take, retries and waits included.
+    std::chrono::milliseconds sendBudget{30000};
+    std::chrono::milliseconds requestTimeout{20000};
+    std::chrono::milliseconds connectTimeout{10000};
+    int maxRetries = 3;  // transient failures retried per message
+    std::chrono::milliseconds firstBackoff{800};
+    std::chrono::milliseconds maxBackoff{60000};
+    // Largest message (and request) body per kind of target.
+    std::size_t serviceBusMessageBytes = 256 * 1024;
+    std::size_t eventHubMessageBytes = 1024 * 1024;
+    std::size_t headroomBytes = 4096;  // properties and headers count toward the service's limit
+    std::size_t maxBatchBytes = 64 * 1024 * 1024;
+    std::chrono::seconds tokenValidity{3600};
+    std::chrono::seconds tokenRenewBefore{300};
+    std::string caFile;  // extra trust anchors (tests); empty: the system's store
+};
+
+// What the last SendOnlineRows did, for tests and information records.
+struct SendStats {
+    std::size_t rows = 0;
+    std::size_t messages = 0;  // messages accepted
+    std::size_t requests = 0;  // HTTP requests made
+    std::size_t bytes = 0;     // body bytes accepted
+};
+
+class AzureClient {
+public:
+    AzureClient(ILogger* logger, ProxySettings proxy, ClientOptions options = {});
+    ~AzureClient();
+
+    bool Begin(std::u16string_view connectionString, std::u16string_view entity, bool eventHub, int format);
+    bool Add(const Row& row);
+    bool Send();
+
+    const SendStats& LastSend() const { return m_lastSend; }
+
+private:
+    struct Target;
+    enum class MessageResult { Accepted, TooLarge, Failed };
+
+    Target* FindOrAddTarget(const std::string& connectionText, ConnectionString connection,
+                            const std::string& entity, bool eventHub);
+    MessageResult SendMessage(std::size_t first, std::size_t last,
+                              std::chrono::steady_clock::time_point deadline);
+    const std::string& Token(Target& target, bool renew);
+    void Fail(std::size_t rows, const std::string& reason);
+
+    Log m_log;
+    ProxySettings m_proxy;
+    ClientOptions m_options;
+    Backoff m_backoff;
+    std::map<std::string, std::unique_ptr<Target>> m_targets;  // by connection string, entity and kind
+    Target* m_current = nullptr;                               // target of the open batch
+    std::optional<RowBuffer> m_rows;                           // the open batch
+    std::size_t m_maxMessageBytes = 0;
+    SendStats m_lastSend;
+};
+
+}  // namespace corvell

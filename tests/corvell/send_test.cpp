@@ -1,0 +1,506 @@
+// Sending to azure-local, grouped by what can go wrong on the way.
+
+#include <gtest/gtest.h>
+
+#include <QTemporaryDir>
+
+#include <dlfcn.h>
+#include <netinet/in.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <chrono>
+#include <cmath>
+
+#include "AzureClient.h"
+#include "AzureLocalProcess.h"
+#include "RecordingLogger.h"
+#include "Sas.h"
+
+using namespace corvell;
+using azurelocal::AzureLocalProcess;
+using Clock = std::chrono::steady_clock;
+using std::chrono::milliseconds;
+
+namespace {
+
+ClientOptions FastOptions() {
+    ClientOptions o;
+    o.sendBudget = milliseconds(5000);
+    o.requestTimeout = milliseconds(2000);
+    o.connectTimeout = milliseconds(1000);
+    o.firstBackoff = milliseconds(50);
+    return o;
+}
+
+std::unique_ptr<AzureLocalProcess> StartServer(const QStringList& arguments = {}) {
+    std::string error;
+    auto server = AzureLocalProcess::Start(arguments, error);
+    EXPECT_TRUE(server) << error;
+    return server;
+}
+
+struct TestRow {
+    std::u16string project, variable, text;
+    double value = 0;
+    bool isText = false;
+    std::uint32_t time = 0;
+    std::uint16_t ms = 0;
+    std::uint64_t status = 0;
+};
+
+std::vector<TestRow> MakeRows(std::size_t n) {
+    std::vector<TestRow> rows;
+    for (std::size_t i = 0; i < n; ++i) {
+        TestRow r;
+        r.project = u"Line" + QString::number(i % 3).toStdU16String();
+        r.variable = u"Var\u00e9" + QString::number(i).toStdU16String();
+        r.isText = i % 4 == 3;
+        if (r.isText) r.text = u"text <&> \"" + QString::number(i).toStdU16String();
+        r.value = r.isText ? 0 : static_cast<double>(i) * 1.25 - 7;
+        r.time = 1700000000u + static_cast<std::uint32_t>(i);
+        r.ms = static_cast<std::uint16_t>(i % 1000);
+        r.status = (static_cast<std::uint64_t>(i) << 33) | i;
+        rows.push_back(r);
+    }
+    return rows;
+}
+
+Row ToRow(const TestRow& t) {
+    Row row;
+    row.project = t.project;
+    row.variable = t.variable;
+    row.text = t.text;
+    row.value = t.value;
+    row.isText = t.isText;
+    row.time = t.time;
+    row.milliseconds = t.ms;
+    row.status = t.status;
+    return row;
+}
+
+bool SendRows(AzureClient& client, const std::string& connection, const std::string& entity, bool eventHub,
+              int format, const std::vector<TestRow>& rows) {
+    if (!client.Begin(QString::fromStdString(connection).toStdU16String(),
+                      QString::fromStdString(entity).toStdU16String(), eventHub, format))
+        return false;
+    for (const auto& r : rows)
+        if (!client.Add(ToRow(r))) return false;
+    return client.Send();
+}
+
+void ExpectArrived(const std::vector<TestRow>& sent, const std::vector<azurelocal::ReceivedRow>& received,
+                   const std::string& entity) {
+    ASSERT_EQ(received.size(), sent.size());
+    for (std::size_t i = 0; i < sent.size(); ++i) {
+        const auto& got = received[i].row;
+        const auto& want = sent[i];
+        EXPECT_EQ(received[i].entity, entity);
+        EXPECT_FALSE(received[i].messageId.empty());
+        EXPECT_EQ(got.project, QString::fromStdU16String(want.project).toStdString());
+        EXPECT_EQ(got.variable, QString::fromStdU16String(want.variable).toStdString());
+        EXPECT_EQ(got.isText, want.isText);
+        if (want.isText) {
+            EXPECT_EQ(got.text, QString::fromStdU16String(want.text).toStdString());
+        } else {
+            EXPECT_EQ(got.value, want.value);
+        }
+        EXPECT_EQ(got.time, want.time);
+        EXPECT_EQ(got.milliseconds, want.ms);
+        EXPECT_EQ(got.status, want.status);
+    }
+}
+
+int FreePortWithNothingListening() {
+    const int fd = socket(AF_INET, SOCK_STREAM, 0);
+    sockaddr_in address{};
+    address.sin_family = AF_INET;
+    address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+    bind(fd, reinterpret_cast<sockaddr*>(&address), sizeof address);
+    socklen_t length = sizeof address;
+    getsockname(fd, reinterpret_cast<sockaddr*>(&address), &length);
+    close(fd);
+    return ntohs(address.sin_port);
+}
+
+class SendTest : public ::testing::Test {
+protected:
+    static void SetUpTestSuite() { s_server = StartServer().release(); }
+    static void TearDownTestSuite() {
+        delete s_server;
+        s_server = nullptr;
+    }
+    void SetUp() override {
+        ASSERT_TRUE(s_server);
+        ASSERT_TRUE(s_server->Reset());
+    }
+    void TearDown() override {
+        // No record of any test may carry the key or a signature.
+        const std::string all = logger.All();
+        EXPECT_EQ(all.find(AzureLocalProcess::kKey), std::string::npos) << all;
+        for (auto at = all.find("sig="); at != std::string::npos; at = all.find("sig=", at + 1))
+            EXPECT_EQ(all.substr(at + 4, 3), "***") << all;
+    }
+
+    AzureLocalProcess& server() { return *s_server; }
+
+    static AzureLocalProcess* s_server;
+    RecordingLogger logger;
+};
+AzureLocalProcess* SendTest::s_server = nullptr;
+
+}  // namespace
+
+// --- Rows arrive intact -------------------------------------------------------
+
+TEST_F(SendTest, RowsArriveIntactInEveryFormatAndMode) {
+    AzureClient client(&logger, {}, FastOptions());
+    const auto rows = MakeRows(40);
+    for (const int format : {0, 1, 2}) {
+        for (const bool eventHub : {false, true}) {
+            ASSERT_TRUE(server().Reset());
+            const std::string entity = eventHub ? "hub-1" : "queue.1";
+            ASSERT_TRUE(SendRows(client, server().ConnectionString(), entity, eventHub, format, rows))
+                << logger.All();
+            const auto received = server().Rows();
+            ExpectArrived(rows, received, entity);
+            const char* formats[] = {"XML", "JSON", "BOND"};
+            if (!received.empty()) {
+                EXPECT_EQ(received[0].format, formats[format]);
+            }
+            EXPECT_EQ(server().Stats().messages, 1u) << "many rows go in one message";
+            EXPECT_EQ(client.LastSend().rows, rows.size());
+        }
+    }
+    EXPECT_TRUE(logger.Errors().empty()) << logger.All();
+}
+
+TEST_F(SendTest, EntityComesFromEntityPathAndAMismatchIsRefused) {
+    AzureClient client(&logger, {}, FastOptions());
+    const auto rows = MakeRows(3);
+    ASSERT_TRUE(SendRows(client, server().ConnectionString(";EntityPath=from-path"), "", false, 1, rows));
+    ASSERT_TRUE(SendRows(client, server().ConnectionString(";EntityPath=same"), "SAME", false, 1, rows));
+    const auto received = server().Rows();
+    ASSERT_EQ(received.size(), 6u);
+    EXPECT_EQ(received[0].entity, "from-path");
+
+    EXPECT_FALSE(SendRows(client, server().ConnectionString(";EntityPath=one"), "other", false, 1, rows));
+    ASSERT_EQ(logger.Errors().size(), 1u);
+    EXPECT_NE(logger.Errors()[0].find("'other' differs from the connection string's EntityPath 'one'"),
+              std::string::npos)
+        << logger.Errors()[0];
+    EXPECT_FALSE(client.Add(ToRow(rows[0]))) << "no batch is open after a refused Begin";
+    EXPECT_FALSE(client.Send());
+    EXPECT_FALSE(SendRows(client, server().ConnectionString(), "", false, 1, rows)) << "no entity at all";
+    EXPECT_EQ(server().Stats().requests, 2u);
+}
+
+TEST_F(SendTest, LibraryExportsDriveTheWholeRoad) {
+    const std::string path = azurelocal::BuildBinaryDir() + "/libCorvell.so";
+    void* library = dlopen(path.c_str(), RTLD_NOW | RTLD_LOCAL);
+    ASSERT_TRUE(library) << dlerror();
+    auto create = reinterpret_cast<PFN_CreateAzureInstance>(dlsym(library, "CreateAzureInstance"));
+    auto destroy = reinterpret_cast<PFN_DestroyAzureInstance>(dlsym(library, "DestroyAzureInstance"));
+    ASSERT_TRUE(create && destroy);
+    IAzureInstance* instance = create(&logger, nullptr, nullptr, nullptr);
+    ASSERT_TRUE(instance);
+    instance->Reserved1();  // harmless
+    const std::u16string connection = QString::fromStdString(server().ConnectionString()).toStdU16String();
+
+    EXPECT_FALSE(instance->BeginOnlineRows(u"Endpoint=nonsense", u"q", false, 1));
+    EXPECT_FALSE(instance->BeginOnlineRows(connection.c_str(), u"q", false, 7)) << "unknown format";
+    EXPECT_EQ(logger.Errors().size(), 2u);
+
+    ASSERT_TRUE(instance->BeginOnlineRows(connection.c_str(), u"q", true, FormatBond));
+    EXPECT_TRUE(instance->AddOnlineRow(u"P", u"V", 0, 3.5, nullptr, false, 1700000000u, 1500, 0xFFFFFFFFu, 0x7u));
+    EXPECT_TRUE(instance->AddOnlineRow(nullptr, u"T", 0, 0, u"txt", true, 4294967295u, 0, 1, 0));
+    EXPECT_TRUE(instance->SendOnlineRows());
+    EXPECT_FALSE(instance->SendOnlineRows()) << "the batch was closed by the first send";
+    destroy(instance);
+    dlclose(library);
+
+    const auto received = server().Rows();
+    ASSERT_EQ(received.size(), 2u);
+    EXPECT_EQ(received[0].row.project, "P");
+    EXPECT_EQ(received[0].row.value, 3.5);
+    EXPECT_EQ(received[0].row.time, 1700000001) << "1500 ms carry into the seconds";
+    EXPECT_EQ(received[0].row.milliseconds, 500u);
+    EXPECT_EQ(received[0].row.status, 0x7'FFFFFFFFull) << "low word first";
+    EXPECT_EQ(received[1].row.project, "");
+    EXPECT_EQ(received[1].row.text, "txt");
+    EXPECT_EQ(received[1].row.time, 4294967295);
+}
+
+// --- Size limits ----------------------------------------------------------------
+
+TEST_F(SendTest, ABatchOverTheLimitIsSplitAndArrivesComplete) {
+    ClientOptions options = FastOptions();
+    options.serviceBusMessageBytes = 8 * 1024;
+    options.headroomBytes = 512;
+    AzureClient client(&logger, {}, options);
+    ASSERT_TRUE(server().SetLimit(8 * 1024));
+    const auto rows = MakeRows(600);
+    for (const int format : {0, 1, 2}) {
+        ASSERT_TRUE(server().Reset());
+        ASSERT_TRUE(server().SetLimit(8 * 1024));
+        ASSERT_TRUE(SendRows(client, server().ConnectionString(), "q", false, format, rows)) << logger.All();
+        ExpectArrived(rows, server().Rows(), "q");
+        const auto stats = server().Stats();
+        EXPECT_GT(stats.messages, 3u);
+        EXPECT_EQ(stats.tooLarge, 0u) << "cut to the limit before sending";
+        EXPECT_LE(stats.bytes / stats.messages, 8u * 1024);
+    }
+}
+
+TEST_F(SendTest, TooLargeAnswersHalveTheMessageUntilItFits) {
+    AzureClient client(&logger, {}, FastOptions());  // believes 256 KB fit
+    ASSERT_TRUE(server().SetLimit(6000));
+    const auto rows = MakeRows(500);
+    ASSERT_TRUE(SendRows(client, server().ConnectionString(), "q", false, 1, rows)) << logger.All();
+    ExpectArrived(rows, server().Rows(), "q");
+    const auto stats = server().Stats();
+    EXPECT_GT(stats.tooLarge, 0u);
+    EXPECT_EQ(stats.rows, rows.size()) << "nothing sent twice";
+    EXPECT_TRUE(logger.Errors().empty()) << logger.All();
+}
+
+TEST_F(SendTest, ARowLargerThanAnyMessageIsRefusedAlone) {
+    ClientOptions options = FastOptions();
+    options.serviceBusMessageBytes = 4096;
+    options.headroomBytes = 256;
+    AzureClient client(&logger, {}, options);
+    ASSERT_TRUE(client.Begin(QString::fromStdString(server().ConnectionString()).toStdU16String(), u"q", false, 1));
+    const auto rows = MakeRows(2);
+    EXPECT_TRUE(client.Add(ToRow(rows[0])));
+    TestRow huge = rows[1];
+    huge.isText = true;
+    huge.text = std::u16string(5000, u'x');
+    EXPECT_FALSE(client.Add(ToRow(huge)));
+    EXPECT_TRUE(client.Add(ToRow(rows[1])));
+    EXPECT_TRUE(client.Send());
+    EXPECT_EQ(server().Rows().size(), 2u);
+    ASSERT_EQ(logger.Errors().size(), 1u);
+    EXPECT_NE(logger.Errors()[0].find("more than a message may hold"), std::string::npos);
+
+    // A service that refuses even one row fails the send instead of looping.
+    ASSERT_TRUE(server().SetLimit(10));
+    EXPECT_FALSE(SendRows(client, server().ConnectionString(), "q", false, 1, MakeRows(4)));
+    EXPECT_LE(server().Stats().requests, 10u);
+}
+
+// --- Tokens ---------------------------------------------------------------------
+
+TEST_F(SendTest, A401RenewsTheTokenOnceAndThenSucceeds) {
+    AzureClient client(&logger, {}, FastOptions());
+    ASSERT_TRUE(server().Fault("status=401&count=1"));
+    ASSERT_TRUE(SendRows(client, server().ConnectionString(), "q", false, 1, MakeRows(5))) << logger.All();
+    EXPECT_EQ(server().Stats().requests, 2u);
+    EXPECT_EQ(server().Rows().size(), 5u);
+}
+
+TEST_F(SendTest, AWrongKeyFailsAfterOneRenewal) {
+    AzureClient client(&logger, {}, FastOptions());
+    const std::string connection = "Endpoint=sb://127.0.0.1:" + std::to_string(server().Port()) +
+                                   "/;SharedAccessKeyName=RootManageSharedAccessKey;SharedAccessKey=wrong-key-text;"
+                                   "UseDevelopmentEmulator=true";
+    EXPECT_FALSE(SendRows(client, connection, "q", false, 1, MakeRows(5)));
+    EXPECT_EQ(server().Stats().requests, 2u);
+    EXPECT_EQ(server().Stats().unauthorized, 2u);
+    ASSERT_EQ(logger.Errors().size(), 1u);
+    EXPECT_NE(logger.Errors()[0].find("HTTP 401"), std::string::npos) << logger.Errors()[0];
+    EXPECT_NE(logger.Errors()[0].find("127.0.0.1:" + std::to_string(server().Port()) + "/q"), std::string::npos)
+        << "names namespace and entity: " << logger.Errors()[0];
+    EXPECT_EQ(logger.All().find("wrong-key-text"), std::string::npos);
+}
+
+TEST_F(SendTest, AReadySignatureIsUsedAsGiven) {
+    AzureClient client(&logger, {}, FastOptions());
+    const std::string resource = "http://127.0.0.1:" + std::to_string(server().Port()) + "/q";
+    const SasToken token =
+        MakeSasToken(resource, AzureLocalProcess::kKeyName, AzureLocalProcess::kKey, std::time(nullptr) + 600);
+    const std::string connection = "Endpoint=sb://127.0.0.1:" + std::to_string(server().Port()) +
+                                   "/;SharedAccessSignature=" + token.token + ";UseDevelopmentEmulator=true";
+    ASSERT_TRUE(SendRows(client, connection, "q", false, 2, MakeRows(3))) << logger.All();
+    EXPECT_EQ(server().Rows().size(), 3u);
+
+    ASSERT_TRUE(server().Fault("status=401&count=1"));
+    EXPECT_FALSE(SendRows(client, connection, "q", false, 2, MakeRows(3))) << "a given token cannot be renewed";
+    EXPECT_EQ(server().Stats().requests, 2u);
+    EXPECT_EQ(logger.All().find(token.signature), std::string::npos);
+}
+
+// --- Transient answers and transport errors ---------------------------------------
+
+TEST_F(SendTest, ServerBusyWithRetryAfterIsRetriedAndSucceeds) {
+    AzureClient client(&logger, {}, FastOptions());
+    ASSERT_TRUE(server().Fault("status=503&count=2&retry-after-ms=150"));
+    const auto start = Clock::now();
+    ASSERT_TRUE(SendRows(client, server().ConnectionString(), "q", false, 1, MakeRows(5))) << logger.All();
+    EXPECT_GE(Clock::now() - start, milliseconds(300)) << "the asked wait was honoured";
+    EXPECT_EQ(server().Stats().requests, 3u);
+    EXPECT_EQ(server().Rows().size(), 5u);
+
+    ASSERT_TRUE(server().Reset());
+    ASSERT_TRUE(server().Fault("status=503&count=1&retry-after=1"));
+    const auto start2 = Clock::now();
+    ASSERT_TRUE(SendRows(client, server().ConnectionString(), "q", true, 2, MakeRows(5))) << logger.All();
+    EXPECT_GE(Clock::now() - start2, milliseconds(1000));
+    EXPECT_EQ(server().Rows().size(), 5u);
+    const auto rows = server().Rows();
+    EXPECT_TRUE(logger.Errors().empty()) << logger.All();
+}
+
+TEST_F(SendTest, ARetriedMessageKeepsItsMessageId) {
+    AzureClient client(&logger, {}, FastOptions());
+    ASSERT_TRUE(server().Fault("kind=close&count=1"));
+    ASSERT_TRUE(SendRows(client, server().ConnectionString(), "q", false, 1, MakeRows(2))) << logger.All();
+    ASSERT_TRUE(SendRows(client, server().ConnectionString(), "q", false, 1, MakeRows(2)));
+    const auto rows = server().Rows();
+    ASSERT_EQ(rows.size(), 4u);
+    EXPECT_EQ(rows[0].messageId, rows[1].messageId);
+    EXPECT_NE(rows[0].messageId, rows[2].messageId) << "a new message gets a new id";
+    EXPECT_EQ(server().Stats().requests, 3u) << "the closed connection was retried once";
+}
+
+TEST_F(SendTest, RetriesEndAfterTheirNumberOrTheTimeBound) {
+    AzureClient client(&logger, {}, FastOptions());
+    ASSERT_TRUE(server().Fault("status=500&count=20"));
+    EXPECT_FALSE(SendRows(client, server().ConnectionString(), "q", false, 1, MakeRows(5)));
+    EXPECT_EQ(server().Stats().requests, 4u) << "one attempt and three retries";
+    ASSERT_EQ(logger.Errors().size(), 1u) << logger.All();
+    EXPECT_NE(logger.Errors()[0].find("HTTP 500"), std::string::npos);
+
+    // A wait the service asks for beyond the bound fails at once rather than sleeping.
+    ASSERT_TRUE(server().Reset());
+    logger.Clear();
+    ASSERT_TRUE(server().Fault("status=429&count=1&retry-after=60"));
+    const auto start = Clock::now();
+    EXPECT_FALSE(SendRows(client, server().ConnectionString(), "q", false, 1, MakeRows(5)));
+    EXPECT_LT(Clock::now() - start, milliseconds(2000));
+    ASSERT_EQ(logger.Errors().size(), 1u);
+    EXPECT_NE(logger.Errors()[0].find("time bound"), std::string::npos) << logger.Errors()[0];
+}
+
+TEST_F(SendTest, AStalledServerEndsWithinTheTimeBound) {
+    ClientOptions options = FastOptions();
+    options.sendBudget = milliseconds(1500);
+    options.requestTimeout = milliseconds(600);
+    AzureClient client(&logger, {}, options);
+    ASSERT_TRUE(server().Fault("kind=stall&count=50"));
+    const auto start = Clock::now();
+    EXPECT_FALSE(SendRows(client, server().ConnectionString(), "q", false, 1, MakeRows(5)));
+    const auto elapsed = Clock::now() - start;
+    EXPECT_GE(elapsed, milliseconds(600));
+    EXPECT_LT(elapsed, milliseconds(1500 + 1000));
+    EXPECT_EQ(logger.Errors().size(), 1u) << logger.All();
+}
+
+TEST_F(SendTest, ARefusedConnectionFailsWithinTheTimeBound) {
+    ClientOptions options = FastOptions();
+    options.sendBudget = milliseconds(1000);
+    AzureClient client(&logger, {}, options);
+    const std::string connection = "Endpoint=sb://127.0.0.1:" + std::to_string(FreePortWithNothingListening()) +
+                                   "/;SharedAccessKeyName=k;SharedAccessKey=some-key;UseDevelopmentEmulator=true";
+    const auto start = Clock::now();
+    EXPECT_FALSE(SendRows(client, connection, "q", false, 1, MakeRows(5)));
+    EXPECT_LT(Clock::now() - start, milliseconds(2500));
+    ASSERT_EQ(logger.Errors().size(), 1u) << logger.All();
+    EXPECT_NE(logger.Errors()[0].find("transport error"), std::string::npos) << logger.Errors()[0];
+}
+
+// --- Permanent answers ------------------------------------------------------------
+
+TEST_F(SendTest, BadRequestAndMissingEntityFailAtOnce) {
+    AzureClient client(&logger, {}, FastOptions());
+    for (const int status : {400, 404, 410, 403}) {
+        ASSERT_TRUE(server().Reset());
+        logger.Clear();
+        ASSERT_TRUE(server().Fault("status=" + std::to_string(status) + "&count=5"));
+        EXPECT_FALSE(SendRows(client, server().ConnectionString(), "q", false, 1, MakeRows(3)));
+        EXPECT_EQ(server().Stats().requests, 1u) << status;
+        ASSERT_EQ(logger.Errors().size(), 1u);
+        EXPECT_NE(logger.Errors()[0].find("HTTP " + std::to_string(status)), std::string::npos);
+        EXPECT_NE(logger.Errors()[0].find("injected fault"), std::string::npos) << "the service's error text";
+    }
+}
+
+TEST(SendToOtherServers, AnUnknownEntityGets404FromTheReceiver) {
+    auto server = StartServer({"--entity", "known"});
+    ASSERT_TRUE(server);
+    RecordingLogger logger;
+    AzureClient client(&logger, {}, FastOptions());
+    EXPECT_TRUE(SendRows(client, server->ConnectionString(), "known", false, 1, MakeRows(2)));
+    EXPECT_FALSE(SendRows(client, server->ConnectionString(), "unknown", false, 1, MakeRows(2)));
+    ASSERT_EQ(logger.Errors().size(), 1u);
+    EXPECT_NE(logger.Errors()[0].find("HTTP 404 (The messaging entity 'unknown' could not be found.)"),
+              std::string::npos)
+        << logger.Errors()[0];
+}
+
+// --- Secrets ----------------------------------------------------------------------
+
+TEST_F(SendTest, AnErrorTextEchoingTheTokenIsMasked) {
+    AzureClient client(&logger, {}, FastOptions());
+    ASSERT_TRUE(server().Fault("kind=echo-auth&status=400"));
+    EXPECT_FALSE(SendRows(client, server().ConnectionString(), "q", false, 1, MakeRows(1)));
+    ASSERT_EQ(logger.Errors().size(), 1u);
+    EXPECT_NE(logger.Errors()[0].find("***"), std::string::npos) << logger.Errors()[0];
+    // TearDown checks that neither the key nor the signature is in any record.
+}
+
+// --- TLS and proxy --------------------------------------------------------------------
+
+TEST(SendToOtherServers, CertificatesAreVerified) {
+    QTemporaryDir dir;
+    std::string cert, key;
+    ASSERT_TRUE(azurelocal::MakeSelfSignedCertificate(dir.path().toStdString(), cert, key));
+    auto server = StartServer({"--tls-cert", QString::fromStdString(cert), "--tls-key", QString::fromStdString(key)});
+    ASSERT_TRUE(server);
+    const std::string connection = "Endpoint=sb://127.0.0.1:" + std::to_string(server->Port()) +
+                                   "/;SharedAccessKeyName=" + AzureLocalProcess::kKeyName +
+                                   ";SharedAccessKey=" + AzureLocalProcess::kKey;
+
+    RecordingLogger logger;
+    AzureClient untrusting(&logger, {}, FastOptions());
+    const auto start = Clock::now();
+    EXPECT_FALSE(SendRows(untrusting, connection, "q", false, 1, MakeRows(2)));
+    EXPECT_LT(Clock::now() - start, milliseconds(2000)) << "a TLS failure is not retried";
+    ASSERT_EQ(logger.Errors().size(), 1u);
+    EXPECT_NE(logger.Errors()[0].find("TLS failure"), std::string::npos) << logger.Errors()[0];
+
+    ClientOptions options = FastOptions();
+    options.caFile = cert;
+    RecordingLogger logger2;
+    AzureClient trusting(&logger2, {}, options);
+    EXPECT_TRUE(SendRows(trusting, connection, "q", false, 1, MakeRows(2))) << logger2.All();
+    EXPECT_EQ(server->Rows().size(), 2u);
+}
+
+TEST(SendToOtherServers, ProxySettingsReachTheProxy) {
+    auto proxy = StartServer({"--proxy-auth", "CORP\\user:proxy-pass"});
+    ASSERT_TRUE(proxy);
+    // The target itself is unreachable: only the proxy can deliver.
+    const std::string connection = "Endpoint=sb://127.0.0.1:" + std::to_string(FreePortWithNothingListening()) +
+                                   "/;SharedAccessKeyName=" + AzureLocalProcess::kKeyName +
+                                   ";SharedAccessKey=" + AzureLocalProcess::kKey + ";UseDevelopmentEmulator=true";
+    RecordingLogger logger;
+    ProxySettings settings;
+    settings.address = "127.0.0.1:" + std::to_string(proxy->Port());
+    settings.user = "CORP\\user";
+    settings.password = "proxy-pass";
+    AzureClient client(&logger, settings, FastOptions());
+    ASSERT_TRUE(SendRows(client, connection, "q", false, 1, MakeRows(3))) << logger.All();
+    EXPECT_EQ(proxy->Rows().size(), 3u);
+    EXPECT_GE(proxy->Stats().proxied, 1u);
+
+    ProxySettings wrong;
+    wrong.address = settings.address;
+    wrong.user = "CORP\\user";
+    wrong.password = "bad-pass";
+    RecordingLogger logger2;
+    AzureClient refused(&logger2, wrong, FastOptions());
+    EXPECT_FALSE(SendRows(refused, connection, "q", false, 1, MakeRows(3)));
+    ASSERT_EQ(logger2.Errors().size(), 1u);
+    EXPECT_NE(logger2.Errors()[0].find("407"), std::string::npos) << logger2.Errors()[0];
+    EXPECT_EQ(logger2.All().find("bad-pass"), std::string::npos);
+}

@@ -1,0 +1,64 @@
+#pragma once
+// Runs azure-local as a child process on a free loopback port and drives it
+// through its control endpoints. For tests and benchmarks.
+
+#include <QProcess>
+#include <QStringList>
+
+#include <cstdint>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "RowDecoders.h"
+
+namespace azurelocal {
+
+struct ReceivedRow {
+    DecodedRow row;
+    std::string entity;
+    std::string format;
+    std::string messageId;
+};
+
+struct ServerStats {
+    std::uint64_t requests = 0, messages = 0, rows = 0, rejected = 0, bytes = 0, proxied = 0, unauthorized = 0,
+                  tooLarge = 0;
+};
+
+class AzureLocalProcess {
+public:
+    static constexpr const char* kKeyName = "RootManageSharedAccessKey";
+    static constexpr const char* kKey = "azure-local-key";
+
+    // Starts the program found beside the running one; null with a reason on failure.
+    static std::unique_ptr<AzureLocalProcess> Start(const QStringList& arguments, std::string& error);
+    ~AzureLocalProcess();
+
+    int Port() const { return m_port; }
+    // "Endpoint=sb://127.0.0.1:<port>/;SharedAccessKeyName=..;SharedAccessKey=..;UseDevelopmentEmulator=true"
+    std::string ConnectionString(const std::string& extra = "") const;
+
+    bool Fault(const std::string& query);  // e.g. "kind=status&status=503&count=2&retry-after=1"
+    bool Reset();
+    bool SetLimit(std::size_t bytes);
+    ServerStats Stats();
+    std::vector<ReceivedRow> Rows();
+
+private:
+    AzureLocalProcess() = default;
+    bool Control(const std::string& method, const std::string& path, std::string* body = nullptr);
+
+    QProcess m_process;
+    int m_port = 0;
+    std::string m_tlsCertificate;  // the server's certificate when it serves HTTPS
+};
+
+// Where the programs of this build are (the running program's folder).
+std::string BuildBinaryDir();
+
+// Writes a self-signed certificate for 127.0.0.1 and its RSA key (PEM) into
+// dir; false on failure.
+bool MakeSelfSignedCertificate(const std::string& dir, std::string& certFile, std::string& keyFile);
+
+}  // namespace azurelocal

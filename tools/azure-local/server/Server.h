@@ -1,0 +1,100 @@
+#pragma once
+// azure-local: a loopback HTTP(S) server that receives messages the way the
+// Service Bus and Event Hubs send endpoints do.
+
+#include <QByteArray>
+#include <QFile>
+#include <QHash>
+#include <QHostAddress>
+#include <QList>
+#include <QMap>
+#include <QObject>
+#include <QSet>
+#include <QString>
+#include <QTcpServer>
+
+#include <cstdint>
+#include <deque>
+#include <string>
+#include <vector>
+
+class QTcpSocket;
+
+namespace azurelocal {
+
+struct ServerConfig {
+    QHostAddress address = QHostAddress::LocalHost;
+    quint16 port = 0;
+    QString keyName = "RootManageSharedAccessKey";
+    QString key = "azure-local-key";
+    QSet<QString> entities;  // empty: every entity exists
+    qint64 serviceBusLimit = 256 * 1024;
+    qint64 eventHubLimit = 1024 * 1024;
+    QString recordPath;  // JSON lines of received rows; "-": standard output
+    std::size_t keepRows = 100000;
+    QString tlsCertificate;
+    QString tlsKey;
+    QString proxyCredentials;  // "user:password": answer requests in proxy form only with them
+};
+
+struct HttpRequest {
+    QByteArray method;
+    QByteArray target;
+    QMap<QByteArray, QByteArray> headers;  // lower-case names
+    QByteArray body;
+};
+
+struct HttpReply {
+    int status = 201;
+    QList<QPair<QByteArray, QByteArray>> headers;
+    QByteArray body;
+};
+
+// An injected fault, used for the next `remaining` send requests.
+struct Fault {
+    enum class Kind { Status, Stall, Close, EchoAuthorization } kind = Kind::Status;
+    int status = 503;
+    QByteArray retryAfter;    // seconds, sent as Retry-After
+    QByteArray retryAfterMs;  // sent as retry-after-ms
+    int remaining = 1;
+};
+
+class Server : public QObject {
+    Q_OBJECT
+public:
+    explicit Server(ServerConfig config, QObject* parent = nullptr);
+    // Listens; false with a reason on failure.
+    bool Start(QString& error);
+    quint16 Port() const;
+
+private:
+    struct SocketState {
+        QByteArray buffer;
+        bool continued = false;  // "100 Continue" sent for the request being read
+        bool stalled = false;    // a stall fault: never answer again
+    };
+
+    void OnNewConnection();
+    void OnReadyRead(QTcpSocket* socket);
+    void Handle(QTcpSocket* socket, const HttpRequest& request);
+    HttpReply HandleSend(const HttpRequest& request, const QByteArray& path, const QByteArray& query,
+                         const QByteArray& authority);
+    HttpReply HandleControl(const HttpRequest& request, const QByteArray& path, const QByteArray& query);
+    void Write(QTcpSocket* socket, const HttpReply& reply, bool close);
+    void Record(const std::vector<std::string>& lines);
+
+    ServerConfig m_config;
+    qint64 m_startServiceBusLimit = 0;  // limits restored by a reset
+    qint64 m_startEventHubLimit = 0;
+    QHash<QTcpSocket*, SocketState> m_states;  // open connections
+    QTcpServer* m_server = nullptr;
+    QFile m_recordFile;
+    std::deque<Fault> m_faults;
+    std::deque<std::string> m_rows;  // the last keepRows rows as JSON lines
+    struct Counters {
+        quint64 requests = 0, messages = 0, rows = 0, rejected = 0, bytes = 0, proxied = 0, unauthorized = 0,
+                tooLarge = 0;
+    } m_counters;
+};
+
+}  // namespace azurelocal
