@@ -6,6 +6,7 @@
 // makes the call return DISP_E_EXCEPTION with EXCEPINFO filled; any other
 // exception does the same with its message (E_OUTOFMEMORY for bad_alloc).
 
+#include "automation/comptr.h"
 #include "automation/comvariant.h"
 #include "automation/error.h"
 
