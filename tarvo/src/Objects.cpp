@@ -38,6 +38,41 @@ protected:
     const ObjectKind m_kind;
 };
 
+// An object with its own dispatch interface id and one event interface,
+// offered through IConnectionPointContainer.
+class CTarvoEventSource : public CTarvoObject, public IConnectionPointContainer {
+public:
+    HRESULT QueryInterface(REFIID iid, void** object) override { return CTarvoObject::QueryInterface(iid, object); }
+    ULONG AddRef() override { return CTarvoObject::AddRef(); }
+    ULONG Release() override { return CTarvoObject::Release(); }
+
+    HRESULT FindConnectionPoint(REFIID events, IConnectionPoint** point) override {
+        if (!point) return E_POINTER;
+        *point = nullptr;
+        if (!m_engine->IsRunning()) return RPC_E_DISCONNECTED;
+        if (!(events == m_eventsIid)) return CONNECT_E_NOCONNECTION;
+        *point = CComPtr<IConnectionPoint>(m_point.Get()).Detach();
+        return S_OK;
+    }
+
+protected:
+    CTarvoEventSource(std::shared_ptr<Engine> engine, ObjectKind kind, const IID& dispatchIid, const IID& eventsIid,
+                      CComPtr<CConnectionPoint> point)
+        : CTarvoObject(std::move(engine), kind), m_dispatchIid(dispatchIid), m_eventsIid(eventsIid),
+          m_point(std::move(point)) {}
+
+    IUnknown* FindInterface(REFIID iid) override {
+        if (iid == m_dispatchIid) return static_cast<IDispatch*>(this);
+        if (iid == IID_IConnectionPointContainer) return static_cast<IConnectionPointContainer*>(this);
+        return CTarvoObject::FindInterface(iid);
+    }
+
+private:
+    const IID m_dispatchIid;
+    const IID m_eventsIid;
+    const CComPtr<CConnectionPoint> m_point;
+};
+
 void ReturnObject(VARIANT* result, CComPtr<IDispatch> object) {
     result->vt = VT_DISPATCH;
     result->pdispVal = object.Detach();  // null: no such object
@@ -146,35 +181,16 @@ private:
 
 // ---- online variable container ---------------------------------------------
 
-class CContainerObject final : public CTarvoObject, public IConnectionPointContainer {
+class CContainerObject final : public CTarvoEventSource {
 public:
     CContainerObject(std::shared_ptr<Engine> engine, std::shared_ptr<ProjectState> project,
                      std::shared_ptr<ContainerState> container)
-        : CTarvoObject(std::move(engine), ObjectKind::Container), m_project(std::move(project)),
-          m_container(std::move(container)) {}
-
-    HRESULT QueryInterface(REFIID iid, void** object) override { return CTarvoObject::QueryInterface(iid, object); }
-    ULONG AddRef() override { return CTarvoObject::AddRef(); }
-    ULONG Release() override { return CTarvoObject::Release(); }
+        : CTarvoEventSource(std::move(engine), ObjectKind::Container, IID_IOnlineVariable, DIID_IOnlineVariableEvents,
+                            container->events),
+          m_project(std::move(project)), m_container(std::move(container)) {}
 
     HRESULT Invoke(DISPID member, WORD flags, DISPPARAMS* params, VARIANT* result, EXCEPINFO* exception) override {
         return Dispatch(this, kMembers, member, flags, params, result, exception);
-    }
-
-    HRESULT FindConnectionPoint(REFIID events, IConnectionPoint** point) override {
-        if (!point) return E_POINTER;
-        *point = nullptr;
-        if (!m_engine->IsRunning()) return RPC_E_DISCONNECTED;
-        if (!(events == DIID_IOnlineVariableEvents)) return CONNECT_E_NOCONNECTION;
-        *point = CComPtr<IConnectionPoint>(m_container->events.Get()).Detach();
-        return S_OK;
-    }
-
-protected:
-    IUnknown* FindInterface(REFIID iid) override {
-        if (iid == IID_IOnlineVariable) return static_cast<IDispatch*>(this);
-        if (iid == IID_IConnectionPointContainer) return static_cast<IConnectionPointContainer*>(this);
-        return CTarvoObject::FindInterface(iid);
     }
 
 private:
@@ -309,33 +325,14 @@ private:
 
 // ---- project ---------------------------------------------------------------
 
-class CProjectObject final : public CTarvoObject, public IConnectionPointContainer {
+class CProjectObject final : public CTarvoEventSource {
 public:
     CProjectObject(std::shared_ptr<Engine> engine, std::shared_ptr<ProjectState> project)
-        : CTarvoObject(std::move(engine), ObjectKind::Project), m_project(std::move(project)) {}
-
-    HRESULT QueryInterface(REFIID iid, void** object) override { return CTarvoObject::QueryInterface(iid, object); }
-    ULONG AddRef() override { return CTarvoObject::AddRef(); }
-    ULONG Release() override { return CTarvoObject::Release(); }
+        : CTarvoEventSource(std::move(engine), ObjectKind::Project, IID_IProject, DIID_IProjectEvents, project->events),
+          m_project(std::move(project)) {}
 
     HRESULT Invoke(DISPID member, WORD flags, DISPPARAMS* params, VARIANT* result, EXCEPINFO* exception) override {
         return Dispatch(this, kMembers, member, flags, params, result, exception);
-    }
-
-    HRESULT FindConnectionPoint(REFIID events, IConnectionPoint** point) override {
-        if (!point) return E_POINTER;
-        *point = nullptr;
-        if (!m_engine->IsRunning()) return RPC_E_DISCONNECTED;
-        if (!(events == DIID_IProjectEvents)) return CONNECT_E_NOCONNECTION;
-        *point = CComPtr<IConnectionPoint>(m_project->events.Get()).Detach();
-        return S_OK;
-    }
-
-protected:
-    IUnknown* FindInterface(REFIID iid) override {
-        if (iid == IID_IProject) return static_cast<IDispatch*>(this);
-        if (iid == IID_IConnectionPointContainer) return static_cast<IConnectionPointContainer*>(this);
-        return CTarvoObject::FindInterface(iid);
     }
 
 private:

@@ -14,13 +14,13 @@ struct Runtime::Impl {
     RuntimeConfig config;
     const bool simulate;
 
-    std::shared_ptr<Engine> engine;  // set while running; used from the controlling thread only
-    CComPtr<IDispatch> application;
-    DWORD registration = 0;
-    std::thread thread;
+    DWORD registration = 0;  // used by the controlling thread only
+    std::thread thread;      // used by the controlling thread only
 
     // The runtime's thread and what it is handed.
     mutable std::mutex queueLock;       // guards everything down to the end of this block
+    std::shared_ptr<Engine> engine;     // set while running
+    CComPtr<IDispatch> application;     // set while running
     std::condition_variable wake;       // new events, a change of pause, or the end
     std::condition_variable delivered;  // m_delivered moved on
     std::deque<std::vector<Event>> queue;
@@ -108,16 +108,17 @@ bool Runtime::Start(std::string* error) {
         return false;
     }
     auto engine = Engine::Create(m->config);
-    m->application = CreateApplicationObject(engine);
+    CComPtr<IDispatch> application = CreateApplicationObject(engine);
     {
         std::lock_guard lock(m->queueLock);
         m->engine = engine;
+        m->application = application;
         m->stopping = false;
         m->threadRunning = true;
         m->queue.clear();
     }
     m->thread = std::thread([impl = m.get()] { impl->Run(); });
-    RegisterActiveObject(m->application.Get(), CLSID_TarvoApplication, &m->registration);
+    RegisterActiveObject(application.Get(), CLSID_TarvoApplication, &m->registration);
     return true;
 }
 
@@ -136,16 +137,22 @@ void Runtime::Stop() {
         m->threadRunning = false;
         m->threadId = {};
     }
-    const auto engine = m->CurrentEngine();
+    std::shared_ptr<Engine> engine;
+    CComPtr<IDispatch> application;  // released after the lock
+    {
+        std::lock_guard lock(m->queueLock);
+        engine = std::exchange(m->engine, nullptr);  // objects clients still hold keep its state alive
+        application = std::exchange(m->application, nullptr);
+    }
     engine->Shutdown();
-    m->application.Release();
-    std::lock_guard lock(m->queueLock);
-    m->engine.reset();  // objects clients still hold keep the engine's state alive
 }
 
 bool Runtime::IsRunning() const { return m->CurrentEngine() != nullptr; }
 
-CComPtr<IDispatch> Runtime::Application() const { return IsRunning() ? m->application : nullptr; }
+CComPtr<IDispatch> Runtime::Application() const {
+    std::lock_guard lock(m->queueLock);
+    return m->application;
+}
 
 void Runtime::SetDelivery(Delivery delivery) {
     std::lock_guard lock(m->queueLock);
