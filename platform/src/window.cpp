@@ -34,6 +34,10 @@ struct SendState {
     }
 };
 
+class WindowReceiver;
+struct WindowRecord;
+std::mutex g_windowsLock;  // guards g_windows and g_nextHandle
+
 const QEvent::Type kMessageEvent = static_cast<QEvent::Type>(QEvent::registerEventType());
 
 class MessageEvent : public QEvent {
@@ -53,6 +57,9 @@ public:
     explicit WindowReceiver(CWnd* window) : m_window(window) {}
 
     bool event(QEvent* e) override {
+        // Qt's queue hands the event over under a lock that ThreadSanitizer
+        // cannot see; taking the lock the poster held makes the hand-off visible.
+        { std::lock_guard<std::mutex> handoff(g_windowsLock); }
         if (e->type() != kMessageEvent) return QObject::event(e);
         auto* m = static_cast<MessageEvent*>(e);
         if (m_window) {
@@ -132,9 +139,9 @@ struct WindowRecord {
 
 // Every live window by handle. Handles are never reused, so a stale handle
 // simply finds nothing.
-std::mutex g_windowsLock;  // guards g_windows and g_nextHandle
 std::unordered_map<HWND, WindowRecord> g_windows;
 std::uintptr_t g_nextHandle = 0x10000;
+
 
 }  // namespace
 

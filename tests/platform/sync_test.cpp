@@ -84,3 +84,14 @@ TEST(Ticks, MonotonicAndConsistent) {
     t.join();
     EXPECT_NE(otherId, GetCurrentThreadId());
 }
+
+TEST(CMutexTest, UnlockByAnotherThreadIsRefused) {
+    CMutex mutex;
+    ASSERT_TRUE(mutex.Lock());
+    bool unlocked = true;
+    std::thread other([&] { unlocked = mutex.Unlock(); });
+    other.join();
+    EXPECT_FALSE(unlocked);
+    EXPECT_TRUE(mutex.Unlock());
+    EXPECT_FALSE(mutex.Unlock());
+}

@@ -4,7 +4,9 @@
 
 #include "platform/types.h"
 
+#include <condition_variable>
 #include <mutex>
+#include <thread>
 
 class CSyncObject {
 public:
@@ -24,13 +26,19 @@ private:
     std::recursive_mutex m_mutex;
 };
 
+// Recursive, with time-outs. Built on a plain mutex and a condition variable
+// (rather than a timed mutex) so that every wait is visible to ThreadSanitizer.
 class CMutex : public CSyncObject {
 public:
     bool Lock(DWORD timeoutMs = INFINITE) override;
-    bool Unlock() override { m_mutex.unlock(); return true; }
+    // Returns false when the calling thread does not hold the mutex.
+    bool Unlock() override;
 
 private:
-    std::recursive_timed_mutex m_mutex;
+    std::mutex m_state;  // guards m_owner and m_depth
+    std::condition_variable m_released;
+    std::thread::id m_owner;
+    unsigned m_depth = 0;
 };
 
 // Scope lock: unlocks on destruction if it holds the lock.

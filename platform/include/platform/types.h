@@ -21,6 +21,12 @@ using LPARAM = std::intptr_t;
 using LRESULT = std::intptr_t;
 using UINT_PTR = std::uintptr_t;
 
+// A point in time as 100-nanosecond intervals since 1601-01-01 00:00 UTC.
+struct FILETIME {
+    DWORD dwLowDateTime;
+    DWORD dwHighDateTime;
+};
+
 #ifndef TRUE
 #define TRUE 1
 #endif
