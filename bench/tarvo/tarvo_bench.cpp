@@ -54,10 +54,10 @@ std::u16string Name(int i) {
 tarvo::RuntimeConfig TenThousandCounters() {
     tarvo::RuntimeConfig config;
     config.tickMs = 100;
-    tarvo::ProjectSpec project;
+    tarvo::ProjectConfig project;
     project.name = u"Bench";
     for (int i = 0; i < kVariables; ++i) {
-        tarvo::VariableSpec v;
+        tarvo::VariableConfig v;
         v.name = Name(i);
         v.generator.kind = tarvo::GeneratorKind::Counter;
         v.generator.periodMs = config.tickMs;  // every variable changes every tick

@@ -22,8 +22,8 @@ bool Fail(std::string* error, const std::string& message) {
     return false;
 }
 
-bool ValidateGenerator(const VariableSpec& v, const std::string& where, std::string* error) {
-    const GeneratorSpec& g = v.generator;
+bool ValidateGenerator(const VariableConfig& v, const std::string& where, std::string* error) {
+    const GeneratorConfig& g = v.generator;
     if (g.periodMs == 0) return Fail(error, where + ": period_ms must be at least 1");
     if (g.cycleMs == 0) return Fail(error, where + ": cycle_ms must be at least 1");
     for (double d : {g.amplitude, g.offset, g.step, g.minimum, g.maximum, v.number}) {
@@ -41,11 +41,11 @@ bool ValidateGenerator(const VariableSpec& v, const std::string& where, std::str
     return true;
 }
 
-bool ValidateProject(ProjectSpec& p, std::string* error) {
+bool ValidateProject(ProjectConfig& p, std::string* error) {
     const std::string where = "project '" + Utf8(p.name) + "'";
     std::set<std::u16string> names;
     std::set<LONG> ids;
-    for (const VariableSpec& v : p.variables) {
+    for (const VariableConfig& v : p.variables) {
         const std::string at = where + ", variable '" + Utf8(v.name) + "'";
         if (v.name.empty()) return Fail(error, where + ": a variable has no name");
         if (!names.insert(v.name).second) return Fail(error, at + ": the name is used twice");
@@ -54,7 +54,7 @@ bool ValidateProject(ProjectSpec& p, std::string* error) {
         if (!ValidateGenerator(v, at, error)) return false;
     }
     LONG next = 1;
-    for (VariableSpec& v : p.variables) {
+    for (VariableConfig& v : p.variables) {
         if (v.id != 0) continue;
         while (ids.count(next)) ++next;
         v.id = next;
@@ -75,7 +75,7 @@ public:
         if (!root.value("projects").isArray()) return Fail(m_error, "the file: \"projects\" must be an array");
         const QJsonArray projects = root.value("projects").toArray();
         for (qsizetype i = 0; i < projects.size(); ++i) {
-            ProjectSpec project;
+            ProjectConfig project;
             if (!ReadProject(projects[i], "projects[" + std::to_string(i) + "]", &project)) return false;
             config->projects.push_back(std::move(project));
         }
@@ -136,7 +136,7 @@ private:
         return Fail(m_error, where + ": \"" + key + "\" must be a whole number, or a text such as \"0x8000000000000001\"");
     }
 
-    bool ReadProject(const QJsonValue& value, const std::string& where, ProjectSpec* project) {
+    bool ReadProject(const QJsonValue& value, const std::string& where, ProjectConfig* project) {
         if (!value.isObject()) return Fail(m_error, where + ": must be an object");
         const QJsonObject o = value.toObject();
         if (!Keys(o, where, {"name", "active", "variables"})) return false;
@@ -156,11 +156,11 @@ private:
     }
 
     // One entry: one variable, or several with "repeat" ("{n}" in the name counts 1..repeat).
-    bool ReadVariables(const QJsonValue& value, const std::string& where, std::vector<VariableSpec>* out) {
+    bool ReadVariables(const QJsonValue& value, const std::string& where, std::vector<VariableConfig>* out) {
         if (!value.isObject()) return Fail(m_error, where + ": must be an object");
         const QJsonObject o = value.toObject();
         if (!Keys(o, where, {"name", "id", "type", "value", "status", "generator", "repeat"})) return false;
-        VariableSpec v;
+        VariableConfig v;
         if (!o.value("name").isString()) return Fail(m_error, where + ": \"name\" must be a text");
         v.name = o.value("name").toString().toStdU16String();
         if (!Unsigned(o, "id", where, &v.id)) return false;
@@ -180,7 +180,7 @@ private:
         if (v.id != 0 && static_cast<double>(v.id) + repeat - 1 > 2147483647.0)
             return Fail(m_error, where + ": the repeated ids go past 2147483647");
         for (DWORD n = 1; n <= repeat; ++n) {
-            VariableSpec copy = v;
+            VariableConfig copy = v;
             if (at != std::u16string::npos) copy.name.replace(at, counter.size(), Utf8ToUtf16(std::to_string(n)));
             if (v.id != 0) copy.id = v.id + static_cast<LONG>(n - 1);
             out->push_back(std::move(copy));
@@ -188,7 +188,7 @@ private:
         return true;
     }
 
-    bool ReadGenerator(const QJsonValue& value, const std::string& where, GeneratorSpec* g) {
+    bool ReadGenerator(const QJsonValue& value, const std::string& where, GeneratorConfig* g) {
         if (!value.isObject()) return Fail(m_error, where + ": must be an object");
         const QJsonObject o = value.toObject();
         if (!Keys(o, where, {"kind", "period_ms", "amplitude", "offset", "cycle_ms", "step", "min", "max", "texts",
@@ -233,7 +233,7 @@ private:
 bool ValidateConfig(RuntimeConfig& config, std::string* error) {
     if (config.tickMs == 0 || config.tickMs > 60000) return Fail(error, "tick_ms must be from 1 to 60000");
     std::set<std::u16string> names;
-    for (ProjectSpec& project : config.projects) {
+    for (ProjectConfig& project : config.projects) {
         if (project.name.empty()) return Fail(error, "a project has no name");
         if (!names.insert(project.name).second)
             return Fail(error, "project '" + Utf8(project.name) + "': the name is used twice");

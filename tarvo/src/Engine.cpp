@@ -60,7 +60,7 @@ Event MakeBulkEvent(const CComPtr<CConnectionPoint>& target, const ProjectState&
     CComVariant times = ArrayVariant(SafeArrayCreateVector(VT_R8, 0, count));
     for (std::uint32_t k = 0; k < count; ++k) {
         const VariableState& v = project.variables[members[k]];
-        static_cast<double*>(ids.parray->pvData)[k] = v.spec.id;
+        static_cast<double*>(ids.parray->pvData)[k] = v.config.id;
         VariantCopy(&static_cast<VARIANT*>(values.parray->pvData)[k], &v.value);
         static_cast<double*>(lows.parray->pvData)[k] = static_cast<double>(v.status & 0xFFFFFFFFu);
         static_cast<double*>(highs.parray->pvData)[k] = static_cast<double>(v.status >> 32);
@@ -79,17 +79,17 @@ Event MakeBulkEvent(const CComPtr<CConnectionPoint>& target, const ProjectState&
 
 std::shared_ptr<Engine> Engine::Create(const RuntimeConfig& config) {
     std::shared_ptr<Engine> engine(new Engine);
-    for (const ProjectSpec& spec : config.projects) {
+    for (const ProjectConfig& projectConfig : config.projects) {
         auto project = std::make_shared<ProjectState>();
-        project->name = spec.name;
-        project->active = spec.active;
+        project->name = projectConfig.name;
+        project->active = projectConfig.active;
         project->events = engine->NewConnectionPoint(DIID_IProjectEvents);
-        project->variables.resize(spec.variables.size());
-        for (size_t i = 0; i < spec.variables.size(); ++i) {
+        project->variables.resize(projectConfig.variables.size());
+        for (size_t i = 0; i < projectConfig.variables.size(); ++i) {
             VariableState& v = project->variables[i];
-            v.spec = spec.variables[i];
+            v.config = projectConfig.variables[i];
             StartGenerator(v);
-            project->byName.emplace(v.spec.name, i);
+            project->byName.emplace(v.config.name, i);
         }
         engine->m_projects.push_back(std::move(project));
     }

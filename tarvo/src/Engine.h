@@ -20,7 +20,7 @@ namespace tarvo {
 DATE NowAsOleDate();
 
 struct VariableState {
-    VariableSpec spec;
+    VariableConfig config;
     CComVariant value;
     ULONGLONG status = 0;
     DATE time = 0;

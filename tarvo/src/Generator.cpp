@@ -17,20 +17,20 @@ void SetNumber(VariableState& v, double number) {
 }  // namespace
 
 void StartGenerator(VariableState& v) {
-    const GeneratorSpec& g = v.spec.generator;
-    v.status = v.spec.status;
-    v.value = v.spec.isText ? CComVariant(std::u16string_view(v.spec.text)) : CComVariant(v.spec.number);
-    v.number = v.spec.number;
+    const GeneratorConfig& g = v.config.generator;
+    v.status = v.config.status;
+    v.value = v.config.isText ? CComVariant(std::u16string_view(v.config.text)) : CComVariant(v.config.number);
+    v.number = v.config.number;
     v.time = NowAsOleDate();
-    v.random.seed(g.seed + static_cast<std::uint32_t>(v.spec.id));
+    v.random.seed(g.seed + static_cast<std::uint32_t>(v.config.id));
     v.nextChangeMs = g.periodMs;
     // A text cycle goes on after the initial text when that is one of its texts.
-    const auto it = std::find(g.texts.begin(), g.texts.end(), v.spec.text);
+    const auto it = std::find(g.texts.begin(), g.texts.end(), v.config.text);
     v.textIndex = it == g.texts.end() ? 0 : static_cast<size_t>(it - g.texts.begin()) + 1;
 }
 
 bool AdvanceGenerator(VariableState& v, ULONGLONG nowMs) {
-    const GeneratorSpec& g = v.spec.generator;
+    const GeneratorConfig& g = v.config.generator;
     if (g.kind == GeneratorKind::Constant || nowMs < v.nextChangeMs) return false;
     // One change per due tick; a period shorter than the tick changes once per tick.
     while (v.nextChangeMs <= nowMs) v.nextChangeMs += g.periodMs;
@@ -59,7 +59,7 @@ bool AdvanceGenerator(VariableState& v, ULONGLONG nowMs) {
         v.textIndex = (v.textIndex + 1) % g.texts.size();
         break;
     case GeneratorKind::StatusFlip:
-        v.status = v.status == g.alternateStatus ? v.spec.status : g.alternateStatus;
+        v.status = v.status == g.alternateStatus ? v.config.status : g.alternateStatus;
         break;
     }
     v.time = NowAsOleDate();

@@ -120,11 +120,11 @@ private:
     // Id and name never change after the engine is built: no lock needed.
     HRESULT Id(const DispatchArgs&, VARIANT* result) {
         result->vt = VT_I4;
-        result->lVal = m_project->variables[m_index].spec.id;
+        result->lVal = m_project->variables[m_index].config.id;
         return S_OK;
     }
     HRESULT Name(const DispatchArgs&, VARIANT* result) {
-        ReturnText(result, m_project->variables[m_index].spec.name);
+        ReturnText(result, m_project->variables[m_index].config.name);
         return S_OK;
     }
 

@@ -264,7 +264,7 @@ std::vector<ContainerInfo> Runtime::Containers(const std::u16string& projectName
         std::lock_guard lock(engine->m_lock);
         for (const auto& [name, container] : project->containers) {
             ContainerInfo info{name, {}, container->started, 0};
-            for (size_t index : container->members) info.variables.push_back(project->variables[index].spec.name);
+            for (size_t index : container->members) info.variables.push_back(project->variables[index].config.name);
             list.push_back(std::move(info));
             points.push_back(container->events);
         }
@@ -280,7 +280,7 @@ std::optional<LONG> Runtime::VariableId(const std::u16string& projectName, const
     if (!project) return std::nullopt;
     const auto it = project->byName.find(variable);
     if (it == project->byName.end()) return std::nullopt;
-    return project->variables[it->second].spec.id;
+    return project->variables[it->second].config.id;
 }
 
 size_t Runtime::ProjectSinks(const std::u16string& projectName) const {

@@ -76,24 +76,24 @@ inline HRESULT Unadvise(IDispatch* source, const IID& events, DWORD cookie) {
 // One variable of each generator the tests need; nothing changes unless told to.
 inline tarvo::RuntimeConfig SmallPlant() {
     tarvo::RuntimeConfig config;
-    tarvo::ProjectSpec plant;
+    tarvo::ProjectConfig plant;
     plant.name = u"Plant";
-    tarvo::VariableSpec level;
+    tarvo::VariableConfig level;
     level.name = u"Level";
     level.number = 50;
-    tarvo::VariableSpec state;
+    tarvo::VariableConfig state;
     state.name = u"State";
     state.isText = true;
     state.text = u"Off";
-    tarvo::VariableSpec count;
+    tarvo::VariableConfig count;
     count.name = u"Count";
     count.id = 40;
     count.generator.kind = tarvo::GeneratorKind::Counter;
     count.generator.periodMs = 100;
     plant.variables = {level, state, count};
-    tarvo::ProjectSpec utilities;
+    tarvo::ProjectConfig utilities;
     utilities.name = u"Utilities";
-    tarvo::VariableSpec power;
+    tarvo::VariableConfig power;
     power.name = u"Power";
     utilities.variables = {power};
     config.projects = {plant, utilities};

@@ -243,10 +243,10 @@ TEST_F(TarvoEvents, RawBulkChangeArrivesAsGiven) {
 
 TEST(TarvoSimulation, GeneratorsChangeValuesEveryPeriod) {
     tarvo::RuntimeConfig config;
-    tarvo::ProjectSpec project;
+    tarvo::ProjectConfig project;
     project.name = u"Sim";
     auto add = [&](const char16_t* name, tarvo::GeneratorKind kind, auto setUp) {
-        tarvo::VariableSpec v;
+        tarvo::VariableConfig v;
         v.name = name;
         v.generator.kind = kind;
         v.generator.periodMs = 100;

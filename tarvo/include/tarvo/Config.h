@@ -21,7 +21,7 @@ enum class GeneratorKind {
     StatusFlip,  // the status alternates between the initial and the alternate status
 };
 
-struct GeneratorSpec {
+struct GeneratorConfig {
     GeneratorKind kind = GeneratorKind::Constant;
     DWORD periodMs = 1000;  // time between two changes, simulated time
     double amplitude = 1.0;
@@ -35,25 +35,25 @@ struct GeneratorSpec {
     std::uint32_t seed = 1;
 };
 
-struct VariableSpec {
+struct VariableConfig {
     std::u16string name;
     LONG id = 0;  // 0: the next free id of the project
     bool isText = false;
     double number = 0.0;   // initial value of a number variable
     std::u16string text;   // initial value of a text variable
     ULONGLONG status = 0;  // initial 64-bit status
-    GeneratorSpec generator;
+    GeneratorConfig generator;
 };
 
-struct ProjectSpec {
+struct ProjectConfig {
     std::u16string name;
     bool active = true;
-    std::vector<VariableSpec> variables;
+    std::vector<VariableConfig> variables;
 };
 
 struct RuntimeConfig {
     DWORD tickMs = 100;  // one bulk event per started container per tick, at most
-    std::vector<ProjectSpec> projects;
+    std::vector<ProjectConfig> projects;
 };
 
 // Checks a configuration and gives every variable without an id the next free
