@@ -62,7 +62,7 @@ DWORD XEvents::Advise(IDispatch* source) {
         FAILED(container->FindConnectionPoint(m_iidEvents, point.Receive())) || !point) {
         return 0;
     }
-    auto dispatch = MakeComObject<CEventSinkDispatch>(m_iidEvents, this);
+    auto dispatch = MakeComObject<CEventSinkDispatch>(m_iidEvents, static_cast<IEventHandler*>(this));
     DWORD cookie = 0;
     if (FAILED(point->Advise(static_cast<IDispatch*>(dispatch.Get()), &cookie)) || cookie == 0) {
         dispatch->Disconnect();
