@@ -145,7 +145,16 @@ bool CXOnlVarsPerProject::PostCommand(int nCommand, bool bWait) {
     if (!WaitIdle(lock, deadline)) return false;
     SetCommand(nCommand);  // still holding the lock (it is recursive): no other command slips in
     if (!bWait) return true;
-    return WaitIdle(lock, deadline);
+    // Wait for this command to be carried out. Waiting for the mailbox to be
+    // empty again would not do: a command posted by another thread right
+    // after ours ran would keep it full and make ours look failed.
+    const unsigned ticket = m_nCommandsRun;
+    lock.Unlock();
+    while (m_nCommandsRun == ticket) {
+        if (static_cast<std::int32_t>(deadline - GetTickCount()) <= 0) return false;
+        Sleep(50);
+    }
+    return true;
 }
 
 bool CXOnlVarsPerProject::WaitIdle(CSingleLock& lock, DWORD dwDeadline) {
@@ -163,6 +172,12 @@ bool CXOnlVarsPerProject::WaitIdle(CSingleLock& lock, DWORD dwDeadline) {
 void CXOnlVarsPerProject::SetCommand(int nCommand) {
     CSingleLock lock(&m_mutex, true);
     m_nCommand = nCommand;
+}
+
+void CXOnlVarsPerProject::CommandDone() {
+    CSingleLock lock(&m_mutex, true);
+    m_nCommand = kNoCommand;
+    ++m_nCommandsRun;
 }
 
 // ---- Timer side ------------------------------------------------------------
@@ -183,7 +198,7 @@ void CXOnlVarsPerProject::Deactivate() {
     DiscardValues();
     if (m_pVariables) m_pVariables->Detach();
     m_pNotify->OnProjectDeactivated(m_strProject);
-    SetCommand(kNoCommand);
+    CommandDone();
 }
 
 void CXOnlVarsPerProject::Activate() {
@@ -192,7 +207,7 @@ void CXOnlVarsPerProject::Activate() {
         m_pVariables->Attach(container.Get());
     }
     m_pNotify->OnProjectActivated(m_strProject);
-    SetCommand(kNoCommand);
+    CommandDone();
 }
 
 void CXOnlVarsPerProject::DrainValues() {

@@ -52,6 +52,7 @@ private:
     bool PostCommand(int nCommand, bool bWait);
     bool WaitIdle(CSingleLock& lock, DWORD dwDeadline);
     void SetCommand(int nCommand);
+    void CommandDone();
     void Deactivate();
     void Activate();
     void DrainValues();
@@ -62,6 +63,7 @@ private:
     VX_KeepRefCmdPtr<COnlVariables> m_pVariables;
     CMutex m_mutex;  // guards m_lstValues and every write of m_nCommand
     std::atomic<int> m_nCommand{kNoCommand};  // pending project command; read by the timer without the lock
+    std::atomic<unsigned> m_nCommandsRun{0};  // commands carried out so far; a waiting poster watches it
     DWORD m_dwTimeout;
     CLstOwner<STarvoVarValue> m_lstValues;  // queued changes, oldest first
     IOnlVariablesPerProjectNotification* m_pNotify;

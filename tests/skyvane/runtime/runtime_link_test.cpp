@@ -323,10 +323,8 @@ TEST_F(RuntimeLink, DeactivationDiscardsAndStopsThenActivationResubscribes) {
 
     ASSERT_TRUE(runtime->SetProjectActive(u"Plant", false));  // its handler waits for our tick
     const ULONGLONG end = GetTickCount64() + 3000;
-    while (target.deactivated.empty() && GetTickCount64() < end) {
-        manager->ProcessPending();
-        Sleep(10);
-    }
+    while (Project(u"Plant")->GetPendingCommand() != CXOnlVarsPerProject::kDeactivate && GetTickCount64() < end) Sleep(1);
+    manager->ProcessPending();
     runtime->Flush();
     ASSERT_EQ(target.deactivated.size(), 1u);
     EXPECT_TRUE(target.inactiveFailed.empty());
@@ -465,4 +463,42 @@ TEST_F(RuntimeLink, StoppedRuntimeLeavesNothingBehind) {
     manager->ReleaseVariables();
     EXPECT_TRUE(manager->Projects().size() == 2u);
     manager.Reset();  // tear-down against a dead runtime: no crash, and no leak (checked in TearDown)
+}
+
+TEST_F(RuntimeLink, ReleasingVariablesDropsChangesThatReferToTheirCells) {
+    MakeManager();
+    ASSERT_EQ(Subscribe({u"Plant#Level", u"Line2#Speed"}), 2);
+    ASSERT_TRUE(manager->Start());
+    FireIds(u"Line2", {double(Id(u"Line2", u"Speed"))});
+    ASSERT_EQ(Project(u"Line2")->GetQueuedCount(), 1);
+    manager->ReleaseVariables();  // what a deactivation of any project leads to
+    EXPECT_EQ(Project(u"Line2")->GetQueuedCount(), 0);
+    manager->ProcessPending();
+    EXPECT_TRUE(target.changes.empty());  // no record with a freed holder cell reaches the bridge
+    EXPECT_FALSE(runtime->Containers(u"Line2").at(0).started);
+}
+
+TEST_F(RuntimeLink, ValuesPassedByReferenceAreQueuedAsValues) {
+    MakeManager();
+    ASSERT_EQ(Subscribe({u"Plant#Level"}), 1);
+    ASSERT_TRUE(manager->Start());
+    double live = 42.5;  // the event's own memory
+    SAFEARRAY* values = SafeArrayCreateVector(VT_VARIANT, 0, 1);
+    LONG index = 0;
+    VARIANT byRef;
+    VariantInit(&byRef);
+    byRef.vt = VT_R8 | VT_BYREF;
+    byRef.pdblVal = &live;
+    SafeArrayPutElement(values, &index, &byRef);
+    CComVariant valuesArg;
+    valuesArg.vt = VT_ARRAY | VT_VARIANT;
+    valuesArg.parray = values;
+    ASSERT_TRUE(runtime->FireRawBulkChange(u"Plant", u"", {CComVariant(1), ArrayOf(VT_R8, 0, {double(Id(u"Plant", u"Level"))}),
+                                                       valuesArg, ArrayOf(VT_R8, 0, {0}), ArrayOf(VT_R8, 0, {0}),
+                                                       ArrayOf(VT_R8, 0, {0})}));
+    live = -1;  // gone or changed once the event has returned
+    manager->ProcessPending();
+    ASSERT_EQ(target.changes.size(), 1u);
+    EXPECT_EQ(target.changes[0].vt, VT_R8);
+    EXPECT_EQ(target.changes[0].number, 42.5);
 }
