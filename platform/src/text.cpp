@@ -5,6 +5,7 @@
 #include <algorithm>
 #include <cmath>
 #include <cstdio>
+#include <ostream>
 
 namespace {
 
@@ -418,3 +419,5 @@ std::u16string CString::FormatList(const char16_t* format, const FormatArg* args
     }
     return out;
 }
+
+std::ostream& operator<<(std::ostream& out, const CString& text) { return out << text.ToUtf8(); }

@@ -7,6 +7,7 @@
 #include <concepts>
 #include <cstddef>
 #include <functional>
+#include <iosfwd>
 #include <string>
 #include <string_view>
 
@@ -148,6 +149,9 @@ public:
 private:
     std::u16string m_str;
 };
+
+// Writes the text as UTF-8 (test output, diagnostics).
+std::ostream& operator<<(std::ostream& out, const CString& text);
 
 inline FormatArg::FormatArg(const CString& t) : FormatArg(t.View()) {}
 
