@@ -74,8 +74,8 @@ private:
     }
 };
 
-tarvo::VariableSpec Number(const char16_t* name, double value) {
-    tarvo::VariableSpec v;
+tarvo::VariableConfig Number(const char16_t* name, double value) {
+    tarvo::VariableConfig v;
     v.name = name;
     v.number = value;
     return v;
@@ -83,16 +83,16 @@ tarvo::VariableSpec Number(const char16_t* name, double value) {
 
 tarvo::RuntimeConfig PlantConfig() {
     tarvo::RuntimeConfig config;
-    tarvo::ProjectSpec plant;
+    tarvo::ProjectConfig plant;
     plant.name = u"Plant";
     for (const char16_t* name : {u"Level", u"Temp", u"Tank#Level", u"Flow", u"Pressure", u"Speed"})
         plant.variables.push_back(Number(name, 1.0));
-    tarvo::VariableSpec text;
+    tarvo::VariableConfig text;
     text.name = u"Mode";
     text.isText = true;
     text.text = u"auto";
     plant.variables.push_back(text);
-    tarvo::ProjectSpec line;
+    tarvo::ProjectConfig line;
     line.name = u"Line2";
     line.variables = {Number(u"Speed", 2.0), Number(u"Torque", 3.0)};
     config.projects = {plant, line};
