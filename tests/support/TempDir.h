@@ -1,0 +1,54 @@
+#pragma once
+// A fresh directory for one test, removed with everything in it at the end.
+
+#include <gtest/gtest.h>
+
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <iterator>
+#include <string>
+
+class TempDir {
+public:
+    TempDir() {
+        const char* base = std::getenv("TMPDIR");
+        std::string pattern = std::string(base && *base ? base : "/tmp") + "/skyvane-test-XXXXXX";
+        if (!mkdtemp(pattern.data())) ADD_FAILURE() << "cannot create a temporary directory";
+        m_path = pattern;
+    }
+    ~TempDir() {
+        std::error_code ignored;
+        std::filesystem::remove_all(m_path, ignored);
+    }
+    TempDir(const TempDir&) = delete;
+    TempDir& operator=(const TempDir&) = delete;
+
+    const std::filesystem::path& Path() const { return m_path; }
+    std::filesystem::path operator/(const std::string& name) const { return m_path / name; }
+
+private:
+    std::filesystem::path m_path;
+};
+
+inline std::string ReadBytes(const std::filesystem::path& file) {
+    std::ifstream in(file, std::ios::binary);
+    return std::string(std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>());
+}
+
+inline void WriteBytes(const std::filesystem::path& file, const std::string& bytes) {
+    std::ofstream out(file, std::ios::binary | std::ios::trunc);
+    out << bytes;
+}
+
+// A file of the shared samples folder ($SKYVANE_SHARED_DIR/samples, else
+// $SKYVANE_SOURCE_DIR/../shared/samples); fails the test clearly when it is missing.
+inline std::filesystem::path SamplePath(const std::string& name) {
+    const char* shared = std::getenv("SKYVANE_SHARED_DIR");
+    const char* top = std::getenv("SKYVANE_SOURCE_DIR");
+    const std::filesystem::path dir = shared && *shared ? std::filesystem::path(shared)
+                                                        : std::filesystem::path(top ? top : ".") / ".." / "shared";
+    const std::filesystem::path path = dir / "samples" / name;
+    if (!std::filesystem::exists(path)) ADD_FAILURE() << "sample file missing: " << path << " (set SKYVANE_SOURCE_DIR)";
+    return path;
+}
