@@ -224,3 +224,12 @@ bool VX_CPrivateProfileSession::Commit() {
     it->second.dirty = false;
     return true;
 }
+
+void VX_CPrivateProfileSession::Discard() {
+    std::lock_guard lock(g_lock);
+    auto it = g_sessions.find(m_path);
+    if (it == g_sessions.end()) return;
+    const int sessions = it->second.sessions;
+    it->second = Load(m_path);
+    it->second.sessions = sessions;
+}

@@ -65,6 +65,8 @@ public:
     // the file was replaced; false when it could not be (the changes stay
     // pending for a later Commit).
     bool Commit();
+    // Drops pending changes: the session reads the file as it is now.
+    void Discard();
 
 private:
     std::string m_path;
