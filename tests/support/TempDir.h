@@ -1,5 +1,6 @@
 #pragma once
-// A fresh directory for one test, removed with everything in it at the end.
+// A fresh directory for one test, removed with everything in it at the end,
+// and access to the shared sample files.
 
 #include <gtest/gtest.h>
 
@@ -12,15 +13,11 @@
 class TempDir {
 public:
     TempDir() {
-        const char* base = std::getenv("TMPDIR");
-        std::string pattern = std::string(base && *base ? base : "/tmp") + "/skyvane-test-XXXXXX";
+        std::string pattern = (std::filesystem::temp_directory_path() / "skyvane-test-XXXXXX").string();
         if (!mkdtemp(pattern.data())) ADD_FAILURE() << "cannot create a temporary directory";
         m_path = pattern;
     }
-    ~TempDir() {
-        std::error_code ignored;
-        std::filesystem::remove_all(m_path, ignored);
-    }
+    ~TempDir() { std::filesystem::remove_all(m_path); }
     TempDir(const TempDir&) = delete;
     TempDir& operator=(const TempDir&) = delete;
 
@@ -37,12 +34,11 @@ inline std::string ReadBytes(const std::filesystem::path& file) {
 }
 
 inline void WriteBytes(const std::filesystem::path& file, const std::string& bytes) {
-    std::ofstream out(file, std::ios::binary | std::ios::trunc);
-    out << bytes;
+    std::ofstream(file, std::ios::binary | std::ios::trunc) << bytes;
 }
 
-// A file of the shared samples folder ($SKYVANE_SHARED_DIR/samples, else
-// $SKYVANE_SOURCE_DIR/../shared/samples); fails the test clearly when it is missing.
+// A file of the shared samples ($SKYVANE_SHARED_DIR/samples, else
+// $SKYVANE_SOURCE_DIR/../shared/samples); fails the test clearly when missing.
 inline std::filesystem::path SamplePath(const std::string& name) {
     const char* shared = std::getenv("SKYVANE_SHARED_DIR");
     const char* top = std::getenv("SKYVANE_SOURCE_DIR");
