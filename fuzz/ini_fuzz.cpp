@@ -27,6 +27,9 @@ const std::string& ScratchFile() {
         const std::string base = access("/dev/shm", W_OK) == 0 ? "/dev/shm" : (dir && *dir ? dir : "/tmp");
         return base + "/ini_fuzz-" + std::to_string(getpid()) + ".ini";
     }();
+    static const struct RemoveAtExit {
+        ~RemoveAtExit() { std::remove(path.c_str()); }
+    } cleanup;
     return path;
 }
 
