@@ -108,13 +108,11 @@ TEST_F(ProfileTest, WriteKeepsEveryOtherLineByteForByte) {
 
 TEST_F(ProfileTest, RefusesWhatIsNoLineOrNoFile) {
     WriteBytes(file, "[s]\nk=v\n");
-    EXPECT_FALSE(VX_WritePrivateProfileString(u"s", u"k", u"two\nlines", path));
-    EXPECT_FALSE(VX_WritePrivateProfileString(u"s", u"k", u"cr\rhere", path));
-    EXPECT_FALSE(VX_WritePrivateProfileString(u"s", u"k=x", u"v", path));
-    EXPECT_FALSE(VX_WritePrivateProfileString(u"s", u";k", u"v", path));
-    EXPECT_FALSE(VX_WritePrivateProfileString(u"s]x", u"k", u"v", path));
-    EXPECT_FALSE(VX_WritePrivateProfileString(u" ", u"k", u"v", path));
-    EXPECT_FALSE(VX_WritePrivateProfileString(u"s", u"k", nullptr, path));
+    const LPCWSTR refused[][3] = {{u"s", u"k", u"two\nlines"}, {u"s", u"k", u"cr\rhere"}, {u"s", u"k=x", u"v"},
+                                  {u"s", u";k", u"v"},          {u"s]x", u"k", u"v"},     {u" ", u"k", u"v"},
+                                  {u"s", u"k", nullptr}};
+    for (const auto& [section, key, value] : refused)
+        EXPECT_FALSE(VX_WritePrivateProfileString(section, key, value, path)) << CString(section).ToUtf8();
     EXPECT_EQ(ReadBytes(file), "[s]\nk=v\n");
 
     // A directory or a FIFO reads as empty (without blocking) and is never written.
