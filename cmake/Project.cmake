@@ -14,6 +14,16 @@ elseif(NOT SKYVANE_SANITIZE STREQUAL "")
   message(FATAL_ERROR "SKYVANE_SANITIZE must be empty, 'address' or 'thread'")
 endif()
 
+# Fuzz targets (fuzz/): clang only, everything instrumented for libFuzzer with ASan+UBSan.
+option(SKYVANE_FUZZ "Build the libFuzzer targets (needs clang)" OFF)
+if(SKYVANE_FUZZ)
+  if(NOT CMAKE_CXX_COMPILER_ID STREQUAL "Clang")
+    message(FATAL_ERROR "SKYVANE_FUZZ needs clang: run fuzz/run.sh")
+  endif()
+  add_compile_options(-fsanitize=fuzzer-no-link,address,undefined -fno-omit-frame-pointer)
+  add_link_options(-fsanitize=address,undefined)
+endif()
+
 # Warnings are errors in our own code; third-party headers come in as system headers.
 function(skyvane_warnings target)
   target_compile_options(${target} PRIVATE -Wall -Wextra -Wpedantic -Werror)

@@ -1,0 +1,113 @@
+#include "cloud/VarItem.h"
+
+#include "vxhelper/variant.h"
+
+#include <algorithm>
+#include <cfloat>
+#include <cmath>
+#include <ctime>
+
+namespace {
+
+// The latest time the conversion accepts: 3000-12-31 23:59:59 UTC.
+constexpr LONGLONG kLastTime = 32535215999;
+
+// Seconds since 1970 of calendar fields read as local time; false when the
+// fields are out of range or the time lies outside what is accepted.
+bool LocalTimeToSeconds(const SYSTEMTIME& st, LONGLONG& seconds) {
+    if (st.wMonth < 1 || st.wMonth > 12 || st.wDay < 1 || st.wDay > 31 || st.wHour > 23 || st.wMinute > 59 ||
+        st.wSecond > 59)
+        return false;
+    std::tm fields{};
+    fields.tm_year = st.wYear - 1900;
+    fields.tm_mon = st.wMonth - 1;
+    fields.tm_mday = st.wDay;
+    fields.tm_hour = st.wHour;
+    fields.tm_min = st.wMinute;
+    fields.tm_sec = st.wSecond;
+    fields.tm_isdst = -1;  // the system decides whether daylight saving applies
+    const std::time_t result = std::mktime(&fields);
+    if (result < 0 || result > kLastTime) return false;  // -1 (failure) is caught here too
+    seconds = result;
+    return true;
+}
+
+}  // namespace
+
+CVarItemRtData::CVarItemRtData(const CVarItemRtData& other)
+    : CObject(),
+      m_strValue(other.m_strValue),
+      m_dValue(other.m_dValue),
+      m_dwStatusLow(other.m_dwStatusLow),
+      m_dwStatusHigh(other.m_dwStatusHigh),
+      m_bIsString(other.m_bIsString),
+      m_bValid(other.m_bValid),
+      m_time(other.m_time),
+      m_wMilliseconds(other.m_wMilliseconds) {}
+
+CVarItemRtData& CVarItemRtData::operator=(const CVarItemRtData& other) {
+    if (this == &other) return *this;
+    m_strValue = other.m_strValue;
+    m_dValue = other.m_dValue;
+    m_dwStatusLow = other.m_dwStatusLow;
+    m_dwStatusHigh = other.m_dwStatusHigh;
+    m_bIsString = other.m_bIsString;
+    m_bValid = other.m_bValid;
+    m_time = other.m_time;
+    m_wMilliseconds = other.m_wMilliseconds;
+    return *this;
+}
+
+bool CVarItemRtData::ConvertValue(const VARIANT* value, CString& text, double& number, bool& isText) {
+    isText = value && (value->vt == VT_BSTR || value->vt == (VT_BSTR | VT_BYREF));
+    if (isText) {
+        text = _c_funktionVariantToCString(value);
+        number = 0.0;
+        return true;
+    }
+    bool ok = false;
+    number = _c_funktionVariantToDoubleEx(value, ok);
+    text.Empty();
+    return ok;
+}
+
+bool CVarItemRtData::Update(const VARIANT* value, DWORD statusLow, DWORD statusHigh, const DATE* time) {
+    CString text;
+    double number = 0.0;
+    bool isText = false;
+    if (!ConvertValue(value, text, number, isText)) return false;
+
+    CSingleLock lock(&m_cs, true);
+    const double halfWidth = std::max(1.0, std::fabs(m_dValue)) * DBL_EPSILON;
+    // Equal numbers are inside even where the band is not a number (infinities).
+    const bool inside = number == m_dValue || (number >= m_dValue - halfWidth && number <= m_dValue + halfWidth);
+    const bool changed = text != m_strValue || !inside || statusLow != m_dwStatusLow ||
+                         statusHigh != m_dwStatusHigh || !m_bValid;
+    if (!changed) return false;
+    return SetValue(text, number, isText, statusLow, statusHigh, time);
+}
+
+bool CVarItemRtData::SetValue(const CString& text, double number, bool isText, DWORD statusLow, DWORD statusHigh,
+                              const DATE* time) {
+    CSingleLock lock(&m_cs, true);
+    m_dwStatusLow = statusLow;
+    m_dwStatusHigh = statusHigh;
+    m_strValue = text;
+    m_dValue = number;
+    m_bIsString = isText;
+    m_bValid = true;
+
+    SYSTEMTIME st{};
+    if (!time || !ConvertDATE2Systemtime(*time, &st)) return false;  // no usable time stamp
+    LONGLONG seconds = 0;
+    if (st.wYear >= 1900 && !LocalTimeToSeconds(st, seconds)) return false;
+    m_time = seconds;  // 0 for a year before 1900
+    m_wMilliseconds = st.wMilliseconds;
+    return true;
+}
+
+void CVarItem::SplitKey(const CString& key, CString& project, CString& variable) {
+    const int hash = key.Find(u'#');
+    project = hash < 0 ? CString() : key.Left(hash);
+    variable = hash < 0 ? key : key.Mid(hash + 1);
+}
