@@ -1,14 +1,9 @@
 #include "runtime/MultipleOnlVarsPerPrj.h"
 
+#include "cloud/VarItem.h"
+
 void SplitVariableKey(const CString& key, const CString& defaultProject, CString& project, CString& variable) {
-    const int hash = key.Find(u'#');
-    if (hash < 0) {
-        project.Empty();
-        variable = key;
-    } else {
-        project = key.Left(hash);
-        variable = key.Mid(hash + 1);
-    }
+    CVarItem::SplitKey(key, project, variable);
     if (project.IsEmpty()) project = defaultProject;
 }
 

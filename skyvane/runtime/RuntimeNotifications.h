@@ -2,22 +2,17 @@
 // The record of one queued value change and the notification interfaces
 // between the runtime link's objects and the bridge.
 
-#include "automation/variant.h"
 #include "platform/text.h"
+#include "vxhelper/variant.h"
 
 class CVarItem;
 
 // One value change of one runtime variable, queued per project.
 struct STarvoVarValue {
-    STarvoVarValue() { VariantInit(&vValue); }
-    ~STarvoVarValue() { VariantClear(&vValue); }
-    STarvoVarValue(const STarvoVarValue&) = delete;
-    STarvoVarValue& operator=(const STarvoVarValue&) = delete;
-
-    VARIANT vValue;              // new value; VT_EMPTY when the event gave none
-    DWORD dwId = 0;              // runtime variable id
-    ULONGLONG qwStatus = 0;      // high word from the event's high status, low from its low status
-    double dTime = 0;            // time stamp, OLE DATE
+    VX_CVariant vValue;             // new value; VT_EMPTY when the event gave none
+    DWORD dwId = 0;                 // runtime variable id
+    ULONGLONG qwStatus = 0;         // high word from the event's high status, low from its low status
+    double dTime = 0;               // time stamp, OLE DATE
     CVarItem** ppHolder = nullptr;  // holder cell of the variable, not owned
 };
 
