@@ -6,6 +6,7 @@
 #include <filesystem>
 #include <fstream>
 #include <sstream>
+#include <stdexcept>
 #include <string>
 #include <vector>
 
@@ -24,6 +25,7 @@ public:
     TempFolder& operator=(const TempFolder&) = delete;
 
     std::string Path(const std::string& name = {}) const { return name.empty() ? m_path : m_path + "/" + name; }
+    std::filesystem::path operator/(const std::string& name) const { return std::filesystem::path(m_path) / name; }
 
     std::string Write(const std::string& name, const std::string& text) const {
         std::ofstream(Path(name), std::ios::binary) << text;

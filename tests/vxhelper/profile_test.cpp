@@ -2,7 +2,7 @@
 #include "vxhelper/profile.h"
 
 #include "CStringPrint.h"
-#include "TempDir.h"
+#include "samples.h"
 
 #include <gtest/gtest.h>
 
@@ -26,7 +26,7 @@ std::string Utf16Le(std::string_view ascii) {
 
 class ProfileTest : public ::testing::Test {
 protected:
-    TempDir dir;
+    TempFolder dir;
     std::filesystem::path file = dir / "settings.ini";
     CString path = CString::FromUtf8(file.string());
 };
@@ -118,7 +118,7 @@ TEST_F(ProfileTest, RefusesWhatIsNoLineOrNoFile) {
     // A directory or a FIFO reads as empty (without blocking) and is never written.
     const std::filesystem::path fifo = dir / "fifo.ini";
     ASSERT_EQ(mkfifo(fifo.c_str(), 0600), 0);
-    for (const auto& other : {dir.Path(), fifo, dir / "missing" / "x.ini"}) {
+    for (const auto& other : {std::filesystem::path(dir.Path()), fifo, dir / "missing" / "x.ini"}) {
         const CString otherPath = CString::FromUtf8(other.string());
         EXPECT_EQ(VX_GetPrivateProfileInt(u"s", u"k", 5, otherPath), 5);
         EXPECT_FALSE(VX_WritePrivateProfileString(u"s", u"k", u"v", otherPath));

@@ -1,7 +1,7 @@
 #include "frame/ConfigFile.h"
 
 #include "CStringPrint.h"
-#include "TempDir.h"
+#include "samples.h"
 
 #include <gtest/gtest.h>
 
@@ -28,7 +28,7 @@ protected:
         return config;
     }
 
-    TempDir dir;
+    TempFolder dir;
     std::filesystem::path file = dir / "skyvane.ini";
     CString path = CString::FromUtf8(file.string());
 };
@@ -79,7 +79,7 @@ TEST_F(ConfigFileTest, DefaultsGapsDuplicatesAndCounts) {
     EXPECT_EQ(config.m_lstConnections.GetTail()->m_strQueue, u"q");
 
     // Reading replaces everything; a path that is no file gives the defaults.
-    ReadConfig(CString::FromUtf8(dir.Path().string()), config);
+    ReadConfig(CString::FromUtf8(dir.Path()), config);
     EXPECT_TRUE(config.m_mapVariables.IsEmpty());
     EXPECT_TRUE(config.m_lstConnections.IsEmpty());
 }
