@@ -1,8 +1,8 @@
 // The cloud communication object's logger: the Azure library's records reach
 // the module's log. A program of its own, so that the log sink starts in a
-// process that has not yet used libcurl and OpenSSL: under ThreadSanitizer the
-// sink's locks were seen as missing after they had (see the README's notes on
-// sanitizer builds).
+// process that has not started a child process yet: under ThreadSanitizer the
+// sink's locks went unseen after that (see the README's notes on sanitizer
+// builds).
 #include "cloud/AzureComm.h"
 #include "frame/ConfigData.h"
 #include "frame/MainAccess.h"
