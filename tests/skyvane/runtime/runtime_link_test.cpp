@@ -443,9 +443,10 @@ TEST_F(RuntimeLink, RuntimeThreadFiresWhileTheTimerDrains) {
     producer.join();
     runtime->Flush();
     manager->ProcessPending();
-    // The queue limit (8) may drop some under load; what arrives is in order per variable.
+    // Every change is either forwarded or reported as dropped by the queue
+    // limit (8); what arrives is in order per variable.
     EXPECT_GT(target.ChangeCount(), 0u);
-    EXPECT_LE(target.ChangeCount() + target.queueFull.size(), 300u);
+    EXPECT_EQ(target.ChangeCount() + target.queueFull.size(), 300u);
     double lastLevel = -1;
     for (const auto& c : target.changes) {
         if (c.id != static_cast<DWORD>(Id(u"Plant", u"Level"))) continue;
@@ -501,4 +502,34 @@ TEST_F(RuntimeLink, ValuesPassedByReferenceAreQueuedAsValues) {
     ASSERT_EQ(target.changes.size(), 1u);
     EXPECT_EQ(target.changes[0].vt, VT_R8);
     EXPECT_EQ(target.changes[0].number, 42.5);
+}
+
+namespace {
+class CountingProjectTarget : public IOnlProjectNotifications {
+public:
+    void OnProjectInactive() override { ++inactive; }
+    void OnProjectActive() override { ++active; }
+    int inactive = 0, active = 0;
+};
+}  // namespace
+
+TEST(ProjectWatcher, FollowsARestartedRuntimeAfterAFailedUnadvise) {
+    tarvo::RuntimeOptions options;
+    options.delivery = Delivery::CallerThread;
+    options.simulate = false;
+    CountingProjectTarget target;
+    auto watcher = VX_CreateCounted<COnlProject>(&target);
+    {
+        tarvo::Runtime first(PlantConfig(), options);
+        ASSERT_TRUE(first.Start());
+        ASSERT_TRUE(watcher->Attach(u"Plant"));
+    }  // gone: unadvising at the old runtime can only fail now
+    tarvo::Runtime second(PlantConfig(), options);
+    ASSERT_TRUE(second.Start());
+    ASSERT_TRUE(watcher->Attach(u"Plant"));  // must advise anew, not keep the dead cookie
+    EXPECT_EQ(second.ProjectSinks(u"Plant"), 1u);
+    second.SetProjectActive(u"Plant", false);
+    EXPECT_EQ(target.inactive, 1);
+    watcher.Reset();
+    EXPECT_EQ(second.ProjectSinks(u"Plant"), 0u);
 }
