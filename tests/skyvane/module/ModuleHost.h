@@ -11,6 +11,7 @@
 
 #include <chrono>
 #include <functional>
+#include <memory>
 #include <mutex>
 #include <string>
 #include <vector>
@@ -106,6 +107,21 @@ public:
 
 private:
     std::string m_path;
+};
+
+// The stand-in with one project "Plant" of number variables V0, V1, ...
+// (values change only when fired), for load.
+class CBulkPlant {
+public:
+    explicit CBulkPlant(int variables);
+    // One event in which every variable takes the value.
+    bool FireRound(double value);
+    // The variable keys, "Plant#V0" ...
+    std::vector<std::string> Keys() const;
+
+    std::unique_ptr<tarvo::Runtime> runtime;
+    std::vector<double> ids;
+    bool started = false;
 };
 
 // Stand-in configuration helpers.

@@ -3,7 +3,6 @@
 #include "ModuleHost.h"
 
 #include "AzureLocalProcess.h"
-#include "BulkArrays.h"
 
 #include <gtest/gtest.h>
 
@@ -14,43 +13,6 @@
 namespace {
 
 using azurelocal::AzureLocalProcess;
-
-std::u16string VariableName(int i) { return u"V" + CString::Formatted(u"%d", i).Str(); }
-
-class LoadedRuntime {
-public:
-    explicit LoadedRuntime(int variables) {
-        tarvo::ProjectConfig plant;
-        plant.name = u"Plant";
-        for (int i = 0; i < variables; ++i) plant.variables.push_back(NumberVariable(VariableName(i), 0.0));
-        tarvo::RuntimeConfig config;
-        config.projects = {plant};
-        tarvo::RuntimeOptions options;
-        options.simulate = false;
-        runtime = std::make_unique<tarvo::Runtime>(config, options);
-        std::string error;
-        started = runtime->Start(&error);
-        for (int i = 0; i < variables; ++i) ids.push_back(static_cast<double>(*runtime->VariableId(u"Plant", VariableName(i))));
-    }
-
-    // One event: every variable takes the value.
-    bool FireRound(double value) {
-        const std::vector<double> values(ids.size(), value), zeros(ids.size(), 0.0), times(ids.size(), 45000.25);
-        return runtime->FireRawBulkChange(u"Plant", u"", {CComVariant(static_cast<int>(ids.size())), ArrayOf(VT_R8, 0, ids),
-                                                          ArrayOf(VT_VARIANT, 0, values), ArrayOf(VT_R8, 0, zeros),
-                                                          ArrayOf(VT_R8, 0, zeros), ArrayOf(VT_R8, 0, times)});
-    }
-
-    std::vector<std::string> Keys() const {
-        std::vector<std::string> keys;
-        for (size_t i = 0; i < ids.size(); ++i) keys.push_back("Plant#" + CString(VariableName(static_cast<int>(i))).ToUtf8());
-        return keys;
-    }
-
-    std::unique_ptr<tarvo::Runtime> runtime;
-    std::vector<double> ids;
-    bool started = false;
-};
 
 // Runs the event loop until the module has posted no cycle for a second.
 void PumpUntilQuiet(const CRecordingHostWnd& host) {
@@ -73,7 +35,7 @@ TEST(ModuleLoad, EveryChangeOfTenThousandVariablesIsReceivedOrReportedDropped) {
     auto receiver = AzureLocalProcess::Start({}, error);
     ASSERT_TRUE(receiver) << error;
     constexpr int kVariables = 10000, kRounds = 10;
-    LoadedRuntime plant(kVariables);
+    CBulkPlant plant(kVariables);
     ASSERT_TRUE(plant.started);
     ModuleSettings settings{plant.Keys(), {{receiver->ConnectionString(), "values", false, 1}}};
     WriteSettingsFile(folder.Path("skyvane.ini"), settings);
@@ -119,7 +81,7 @@ TEST(ModuleLoad, WithoutTheAzureClientTheQueueHoldsItsLimitPlusOne) {
     // The module alone in a folder: its Azure client library is not beside it.
     const std::string copy = folder.Path("libSkyvane.so");
     std::filesystem::copy_file(azurelocal::BuildBinaryDir() + "/libSkyvane.so", copy);
-    LoadedRuntime plant(10);  // queue limit 40
+    CBulkPlant plant(10);  // queue limit 40
     ASSERT_TRUE(plant.started);
     WriteSettingsFile(folder.Path("skyvane.ini"), {plant.Keys(), {{"Endpoint=sb://127.0.0.1:9/;SharedAccessKeyName=k;SharedAccessKey=s", "values", false, 1}}});
     CRecordingHostWnd host;

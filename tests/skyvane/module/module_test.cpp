@@ -13,6 +13,7 @@
 #include <cmath>
 #include <map>
 #include <set>
+#include <thread>
 
 namespace {
 
@@ -66,8 +67,9 @@ protected:
         return rows;
     }
 
+    // The receiver's count first: it is cheap, and the rows are read only once enough arrived.
     bool WaitForRows(const std::string& entity, size_t count, const std::string& variable = {}) {
-        return PumpUntil([&] { return RowsOf(entity, variable).size() >= count; });
+        return PumpUntil([&] { return receiver->Stats().rows >= count && RowsOf(entity, variable).size() >= count; });
     }
 
     TempFolder folder;
@@ -263,9 +265,52 @@ TEST_F(ModuleTest, EveryTargetGetsTheSameRowsAndTheStatusCountsThemAll) {
     Set(u"Plant", u"C", 1.0);
     ASSERT_TRUE(WaitForRows("second", 4));
     EXPECT_EQ(RowsOf("first").size(), 4u);
-    const auto messages = host.Messages();
-    EXPECT_TRUE(std::any_of(messages.begin(), messages.end(),
-                            [](const auto& m) { return m.message == kStatus && m.wParam == 6; }));
+    // The cycle's status is posted after its last send.
+    EXPECT_TRUE(PumpUntil([&] {
+        const auto messages = host.Messages();
+        return std::any_of(messages.begin(), messages.end(), [](const auto& m) { return m.message == kStatus && m.wParam == 6; });
+    }));
+}
+
+TEST_F(ModuleTest, ExportsCalledOnAnotherThreadRunOnTheWindowsThread) {
+    StartRuntime({Project(u"Plant", {u"Level"})});
+    WriteSettingsFile(SettingsPath(), {{"Plant#Level"}, {Target("values", 1)}});
+    std::atomic<int> result{-1};
+    std::thread caller([&] { result = module.Init(&context); });
+    ASSERT_TRUE(PumpUntil([&] { return result.load() != -1; }));  // the window's thread carries it out
+    caller.join();
+    EXPECT_EQ(result.load(), 1);
+    Set(u"Plant", u"Level", 3.0);
+    ASSERT_TRUE(WaitForRows("values", 1, "Level"));
+    result = -1;
+    std::thread stopper([&] { result = module.DllExit(); });
+    ASSERT_TRUE(PumpUntil([&] { return result.load() != -1; }));
+    stopper.join();
+    EXPECT_EQ(result.load(), 1);
+}
+
+TEST_F(ModuleTest, ACheckRequestedWhileAMessageBoxIsOpenRunsWhenItCloses) {
+    StartRuntime({Project(u"Plant", {u"Level"})});
+    WriteSettingsFile(SettingsPath(), {{"Plant#Level"}, {Target("values", 1)}});
+    runtime->SetRaiseError(tarvo::ObjectKind::Variables, tarvo::dispid::CollectionItem);  // the lookup fails
+    CMessageBoxRecorder boxes;
+    // While the box is open the runtime recovers and the project becomes
+    // active again: its check is asked for inside the box's loop.
+    boxes.onShow = [&] {
+        if (boxes.Texts().size() > 1) return;
+        runtime->ClearFaults();
+        runtime->SetProjectActive(u"Plant", true);
+        VX_PumpMessages(300);
+    };
+    EXPECT_EQ(module.Init(&context), 0);
+    // The check asked for in the box runs after it: Level is subscribed again.
+    ASSERT_TRUE(PumpUntil([&] {
+        const auto containers = runtime->Containers(u"Plant");
+        return containers.size() == 1 && containers[0].started && containers[0].variables.size() == 1;
+    }));
+    Set(u"Plant", u"Level", 8.0);
+    ASSERT_TRUE(WaitForRows("values", 1, "Level"));
+    EXPECT_EQ(boxes.Texts(), std::vector<std::string>{"Variable is unknown:\nPlant#Level"});
 }
 
 }  // namespace
