@@ -218,8 +218,9 @@ TEST_F(ModuleTest, DllExitEndsTheExportAndInitWorksAgain) {
     WriteSettingsFile(SettingsPath(), {{"Plant#Level"}, {Target("values", 1)}});
     ASSERT_EQ(module.Init(&context), 1);
     EXPECT_EQ(module.DllExit(), 1);
-    Set(u"Plant", u"Level", 5.0);
+    VX_PumpMessages(100);  // what the worker posted before it ended
     host.Clear();
+    Set(u"Plant", u"Level", 5.0);
     VX_PumpMessages(300);  // ticks arrive and must do nothing
     EXPECT_TRUE(host.Messages().empty());
     EXPECT_TRUE(receiver->Rows().empty());
