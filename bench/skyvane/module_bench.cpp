@@ -88,12 +88,8 @@ int main(int argc, char** argv) {
     CBulkPlant plant(kVariables);
     ModuleSettings settings{plant.Keys(), {{receiver->ConnectionString(), "values", false, 1}}};
     WriteSettingsFile(folder.Path("skyvane.ini"), settings);
-    CRecordingHostWnd host;
-    CConfigData context;
-    context.m_pWnd = &host;
-    context.m_strIniFile = CString(folder.Path("skyvane.ini"));
-    CModuleUnderTest module;
-    if (!plant.started || !module.Loaded() || module.Init(&context) != 1) {
+    CHostedModule hosted(folder.Path("skyvane.ini"));
+    if (!plant.started || !hosted.module.Loaded() || hosted.Init() != 1) {
         std::fprintf(stderr, "the module did not start\n");
         return 1;
     }
@@ -118,7 +114,7 @@ int main(int argc, char** argv) {
         if (r.received == r.fired) sustained = std::max(sustained, r.throughput);
     }
     std::printf("highest rate with every change received: %.0f changes/s (one JSON connection)\n", sustained);
-    module.DllExit();
+    hosted.module.DllExit();
     plant.runtime->Stop();
     return 0;
 }

@@ -78,6 +78,20 @@ private:
     int (*m_dllExit)(int) = nullptr;
 };
 
+// What a host holds: its window, a context naming the settings file, and the
+// loaded module (libSkyvane.so of this build when library is empty).
+struct CHostedModule {
+    explicit CHostedModule(const std::string& settingsPath, const std::string& library = {}) : module(library) {
+        context.m_pWnd = &host;
+        context.m_strIniFile = CString(settingsPath);
+    }
+    int Init() { return module.Init(&context); }
+
+    CRecordingHostWnd host;
+    CConfigData context;
+    CModuleUnderTest module;
+};
+
 // Runs the event loop until done() holds or the time is up; returns done().
 bool PumpUntil(const std::function<bool()>& done, std::chrono::milliseconds limit = std::chrono::seconds(20));
 

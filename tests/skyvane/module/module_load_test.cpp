@@ -39,13 +39,9 @@ TEST(ModuleLoad, EveryChangeOfTenThousandVariablesIsReceivedOrReportedDropped) {
     ASSERT_TRUE(plant.started);
     ModuleSettings settings{plant.Keys(), {{receiver->ConnectionString(), "values", false, 1}}};
     WriteSettingsFile(folder.Path("skyvane.ini"), settings);
-    CRecordingHostWnd host;
-    CConfigData context;
-    context.m_pWnd = &host;
-    context.m_strIniFile = CString(folder.Path("skyvane.ini"));
-    CModuleUnderTest module;
-    ASSERT_TRUE(module.Loaded());
-    ASSERT_EQ(module.Init(&context), 1);
+    CHostedModule hosted(folder.Path("skyvane.ini"));
+    ASSERT_TRUE(hosted.module.Loaded());
+    ASSERT_EQ(hosted.Init(), 1);
 
     // A change of every variable each second, for ten seconds.
     const auto start = std::chrono::steady_clock::now();
@@ -61,8 +57,8 @@ TEST(ModuleLoad, EveryChangeOfTenThousandVariablesIsReceivedOrReportedDropped) {
     producer.join();
     PumpUntil([&] { return receiver->Stats().rows >= kVariables * kRounds; }, std::chrono::seconds(30));
     const double seconds = std::chrono::duration<double>(std::chrono::steady_clock::now() - start).count();
-    PumpUntilQuiet(host);
-    module.DllExit();
+    PumpUntilQuiet(hosted.host);
+    hosted.module.DllExit();
 
     std::set<std::pair<std::string, double>> received;
     size_t duplicates = 0;
@@ -84,26 +80,22 @@ TEST(ModuleLoad, WithoutTheAzureClientTheQueueHoldsItsLimitPlusOne) {
     CBulkPlant plant(10);  // queue limit 40
     ASSERT_TRUE(plant.started);
     WriteSettingsFile(folder.Path("skyvane.ini"), {plant.Keys(), {{"Endpoint=sb://127.0.0.1:9/;SharedAccessKeyName=k;SharedAccessKey=s", "values", false, 1}}});
-    CRecordingHostWnd host;
-    CConfigData context;
-    context.m_pWnd = &host;
-    context.m_strIniFile = CString(folder.Path("skyvane.ini"));
     {
-        CModuleUnderTest module(copy);
-        ASSERT_TRUE(module.Loaded());
-        ASSERT_EQ(module.Init(&context), 1);
+        CHostedModule hosted(folder.Path("skyvane.ini"), copy);
+        ASSERT_TRUE(hosted.module.Loaded());
+        ASSERT_EQ(hosted.Init(), 1);
         // Rounds of ten changes, each taken over by a tick before the next,
         // so that only the module's own queue overflows: 41 kept, 9 dropped.
         for (int round = 1; round <= 5; ++round) {
             ASSERT_TRUE(plant.FireRound(round));
             VX_PumpMessages(200);
         }
-        module.DllExit();
+        hosted.module.DllExit();
+        EXPECT_EQ(hosted.host.Count(WM_USER + 2), 1);  // only the end of init: no cycle ever ran
     }
     EXPECT_EQ(log.CountContaining("Creating Azure Wrapper failed"), 1);
     EXPECT_EQ(log.CountContaining("Value change queue full: Value change for Plant#V"), 9);
     EXPECT_EQ(log.CountContaining("of project:"), 0);
-    EXPECT_EQ(host.Count(WM_USER + 2), 1);  // only the end of init: no cycle ever ran
     plant.runtime->Stop();
 }
 

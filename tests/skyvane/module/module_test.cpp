@@ -30,8 +30,6 @@ protected:
         receiver = AzureLocalProcess::Start({}, error);
         ASSERT_TRUE(receiver) << error;
         ASSERT_TRUE(module.Loaded());
-        context.m_pWnd = &host;
-        context.m_strIniFile = CString(SettingsPath());
     }
 
     void TearDown() override {
@@ -76,9 +74,10 @@ protected:
     CTestLog log{folder};
     std::unique_ptr<AzureLocalProcess> receiver;
     std::unique_ptr<tarvo::Runtime> runtime;
-    CRecordingHostWnd host;
-    CConfigData context;
-    CModuleUnderTest module;
+    CHostedModule hosted{SettingsPath()};
+    CRecordingHostWnd& host = hosted.host;
+    CConfigData& context = hosted.context;
+    CModuleUnderTest& module = hosted.module;
 };
 
 TEST_F(ModuleTest, ValuesReachEveryTargetInItsFormatOnlyWhenTheyChange) {
