@@ -175,6 +175,19 @@ public:
         std::vector<std::uint8_t> hello{1, 0x53, 0x4B, 0x41, 0x55, 1, 0};
         SendFrame(hello);
     }
+    // Reads exactly n bytes within 5 s.
+    bool Receive(void* data, size_t n) {
+        auto* p = static_cast<char*>(data);
+        while (n > 0) {
+            pollfd waiting{m_fd, POLLIN, 0};
+            if (::poll(&waiting, 1, 5000) <= 0) return false;
+            const ssize_t got = ::recv(m_fd, p, n, 0);
+            if (got <= 0) return false;
+            p += got;
+            n -= static_cast<size_t>(got);
+        }
+        return true;
+    }
     // True when the server closes the connection within 5 s (whatever it sent before).
     bool ClosedByServer() {
         char buffer[256];
@@ -190,6 +203,24 @@ public:
 private:
     int m_fd = -1;
 };
+
+// A call frame's payload: Invoke of member 1 on an object, with raw argument bytes.
+std::vector<std::uint8_t> InvokeFrame(std::uint64_t object, std::uint32_t count, const std::vector<std::uint8_t>& args) {
+    std::vector<std::uint8_t> frame{2, 7, 0, 0, 0, 3};
+    auto put = [&](const void* data, size_t size) {
+        frame.insert(frame.end(), static_cast<const std::uint8_t*>(data), static_cast<const std::uint8_t*>(data) + size);
+    };
+    const std::int32_t member = 1;
+    const std::uint16_t flags = DISPATCH_METHOD;
+    const std::uint8_t wantResult = 1;
+    put(&object, 8);
+    put(&member, 4);
+    put(&flags, 2);
+    put(&wantResult, 1);
+    put(&count, 4);
+    frame.insert(frame.end(), args.begin(), args.end());
+    return frame;
+}
 
 }  // namespace
 
@@ -362,6 +393,13 @@ TEST_F(LocalSocket, MalformedOrTruncatedFramesCloseOnlyThatConnection) {
         {2, 1, 0, 0, 0, 3, 1, 0, 0, 0, 0, 0, 0, 0},   // a call cut short inside its fields
         {4, 99, 0, 0, 0, 0, 0, 0, 0},                 // release of an object never exported
         {3, 1, 0},                                    // a reply too short for its status
+        InvokeFrame(1, 1, {0x05, 0x20, 1, 0, 0, 0, 0, 0xFF, 0xFF, 0xFF, 0x7F}),  // an array larger than the frame
+        InvokeFrame(1, 1, {0x08, 0, 0xFE, 0xFF, 0xFF, 0x7F}),                   // a text larger than the frame
+        InvokeFrame(1, 1, {0xFF, 0x0F}),                                        // a type that does not exist
+        InvokeFrame(1, 65, {}),                                                 // more arguments than allowed
+        InvokeFrame(1, 1, {0x03, 0x40, 0x08, 0, 0, 0, 0, 0}),  // a reference to I4 whose target is a text
+        InvokeFrame(1, 1, {0x0C, 0x40, 0x0C, 0x40, 0, 0}),     // a reference inside a reference
+        InvokeFrame(1, 0, {0}),                                // bytes after the last field
     };
     for (const auto& payload : garbage) {
         RawClient raw(SocketPath());
@@ -388,6 +426,22 @@ TEST_F(LocalSocket, MalformedOrTruncatedFramesCloseOnlyThatConnection) {
         raw.Send(&length, 4);
         raw.Send("abcdefghij", 10);
         EXPECT_TRUE(raw.ClosedByServer());
+    }
+    {
+        // A well-formed call to an object that does not exist gets an error, and the connection stays.
+        RawClient raw(SocketPath());
+        raw.SendHello();
+        std::uint8_t hello[11];
+        ASSERT_TRUE(raw.Receive(hello, sizeof hello));
+        for (int i = 0; i < 2; ++i) {
+            raw.SendFrame(InvokeFrame(12345, 0, {}));
+            std::uint8_t reply[13];
+            ASSERT_TRUE(raw.Receive(reply, sizeof reply));
+            std::int32_t status = 0;
+            std::memcpy(&status, reply + 9, 4);
+            EXPECT_EQ(reply[4], 3);  // a reply
+            EXPECT_EQ(status, CO_E_OBJNOTCONNECTED);
+        }
     }
     // The well-behaved client never noticed.
     EXPECT_EQ(Echo(object.Get(), CComVariant(8)).lVal, 8);

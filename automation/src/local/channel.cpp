@@ -59,11 +59,11 @@ void CChannel::Broken(const std::string& reason) {
     m_replied.notify_all();
     m_work.notify_all();
     ::shutdown(m_fd, SHUT_RDWR);  // wakes the reader
-    Log(reason);
+    if (!reason.empty()) Log(reason);
 }
 
 void CChannel::Close() {
-    Broken("connection closed");
+    Broken({});
     const auto self = std::this_thread::get_id();
     std::unique_lock lock(m_lock);
     const auto deadline = std::chrono::steady_clock::now() + std::chrono::milliseconds(m_options.callTimeoutMs);
@@ -244,7 +244,7 @@ void CChannel::ReadLoop() {
     std::vector<std::uint8_t> frame;
     while (!IsBroken()) {
         if (!ReadFrame(&frame)) {
-            Broken("connection lost");
+            Broken("disconnected");
             break;
         }
         if (!TakeFrame(std::move(frame))) {

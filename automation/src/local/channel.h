@@ -48,7 +48,7 @@ public:
     // Tells the peer that one reference on its object is gone (nothing when broken).
     void SendRelease(std::uint64_t id);
     // Breaks the connection without waiting.
-    void Break() { Broken("connection closed"); }
+    void Break() { Broken({}); }
     // Breaks the connection and waits (bounded) for its threads, except the calling one.
     void Close();
     bool IsBroken() const;
@@ -79,6 +79,7 @@ private:
     bool ReadFrame(std::vector<std::uint8_t>* frame);
     bool ReadExact(std::uint8_t* data, size_t size, bool mayIdle);
     bool SendFrame(const std::vector<std::uint8_t>& frame);
+    // Marks the connection broken; a reason (empty for a close of our own) goes to the log.
     void Broken(const std::string& reason);
     void ReleaseEverything();
     bool TakeFrame(std::vector<std::uint8_t> frame);

@@ -141,7 +141,8 @@ private:
         const std::string path = m_folder + "/" + name + ".sock";
         sockaddr_un address{};
         if (!SocketAddress(path, &address)) return nullptr;
-        const int fd = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+        // Non-blocking, so that a server whose backlog is full cannot hold the caller up.
+        const int fd = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
         if (fd < 0) return nullptr;
         uid_t uid = 0;
         pid_t pid = 0;
@@ -154,7 +155,6 @@ private:
             ::close(fd);
             return nullptr;
         }
-        SetNonBlocking(fd);
         return CChannel::Start(fd, m_options, nullptr, "server " + std::to_string(pid));
     }
 
@@ -188,8 +188,8 @@ public:
         int bound = ::bind(m_listen, at, sizeof address);
         if (bound != 0 && errno == EADDRINUSE) {
             // Left behind by a server that is gone, or still served?
-            const int probe = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-            const bool served = probe >= 0 && ::connect(probe, at, sizeof address) == 0;
+            const int probe = ::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
+            const bool served = probe >= 0 && (::connect(probe, at, sizeof address) == 0 || errno == EAGAIN);
             if (probe >= 0) ::close(probe);
             if (served) {
                 *error = "a server of this class is running already (" + m_path + ")";

@@ -70,7 +70,8 @@ HRESULT WriteArray(Writer& w, VARTYPE element, const SAFEARRAY* array, IObjectMa
         w.U8(0);
         return S_OK;
     }
-    if (array->vt != element || MinWireSize(element) == 0 || (array->cElements && !array->pvData))
+    if (array->vt != element || MinWireSize(element) == 0 || array->cElements > kMaxElements ||
+        (array->cElements && !array->pvData))
         return DISP_E_BADVARTYPE;
     w.U8(1);
     w.I32(array->lLbound);
@@ -101,7 +102,7 @@ bool ReadArray(Reader& r, VARTYPE element, SAFEARRAY** out, IObjectMarshal& mars
     std::int32_t lower = 0;
     std::uint32_t count = 0;
     const std::uint32_t minSize = MinWireSize(element);
-    if (minSize == 0 || !r.I32(&lower) || !r.U32(&count)) return false;
+    if (minSize == 0 || !r.I32(&lower) || !r.U32(&count) || count > kMaxElements) return false;
     if (static_cast<std::uint64_t>(count) * minSize > r.Left()) return false;  // before allocating anything
     SAFEARRAY* array = SafeArrayCreateVector(element, lower, count);
     if (!array) return false;

@@ -19,6 +19,9 @@ constexpr std::uint32_t kMagic = 0x55414B53;  // "SKAU"
 constexpr std::uint16_t kVersion = 1;
 constexpr std::uint32_t kMaxFrame = 64u << 20;  // a bulk change of about a million values fits
 constexpr std::uint32_t kMaxArgs = 64;
+// Elements of one array: bounds what a frame may make the receiver allocate
+// (a variant element is 2 bytes on the wire, 24 in memory).
+constexpr std::uint32_t kMaxElements = 1u << 22;
 constexpr int kMaxDepth = 4;  // variants inside variants (by-reference targets, variant arrays)
 
 enum class Kind : std::uint8_t { Hello = 1, Call = 2, Reply = 3, Release = 4 };
