@@ -58,7 +58,7 @@ public:
         m_reader = std::thread([this, fd = pipeFds[0]] { Collect(fd); });
         std::unique_lock lock(m_lock);
         return m_changed.wait_for(lock, std::chrono::seconds(20), [&] {
-            return m_ended || m_output.find("ready") != std::string::npos;
+            return m_ended || m_output.find(": ready,") != std::string::npos;
         }) && !m_ended;
     }
 
