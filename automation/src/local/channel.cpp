@@ -433,12 +433,16 @@ bool CChannel::Execute(Op op, Reader& r, Writer& reply, std::vector<std::uint64_
         CComPtr<IConnectionPoint> point;
         if (SUCCEEDED(*status)) *status = target.object.QueryInterface(IID_IConnectionPoint, point);
         if (SUCCEEDED(*status)) *status = point->Unadvise(cookie);
+        Advised ended;  // released after the lock
         if (SUCCEEDED(*status)) {
             std::lock_guard lock(m_lock);
             const auto it = std::find_if(m_advised.begin(), m_advised.end(), [&](const Advised& a) {
                 return a.point == point && a.cookie == cookie;
             });
-            if (it != m_advised.end()) m_advised.erase(it);
+            if (it != m_advised.end()) {
+                ended = std::move(*it);
+                m_advised.erase(it);
+            }
         }
         return true;
     }

@@ -20,6 +20,7 @@
 #include <sys/stat.h>
 #include <sys/un.h>
 #include <unistd.h>
+#include <utility>
 
 namespace {
 
@@ -118,19 +119,21 @@ private:
         const auto it = m_channels.find(name);
         if (it == m_channels.end()) return nullptr;
         if (!it->second->IsBroken()) return it->second;
+        dropped = std::move(it->second);
         m_channels.erase(it);
         return nullptr;
     }
     void Keep(const std::string& name, const std::shared_ptr<CChannel>& channel) {
+        std::shared_ptr<CChannel> dropped;  // released after the lock
         std::lock_guard lock(m_lock);
         auto& slot = m_channels[name];
-        if (!slot || slot->IsBroken()) slot = channel;
+        if (!slot || slot->IsBroken()) dropped = std::exchange(slot, channel);
     }
     void Forget(const std::string& name, const std::shared_ptr<CChannel>& channel) {
         {
             std::lock_guard lock(m_lock);
             const auto it = m_channels.find(name);
-            if (it != m_channels.end() && it->second == channel) m_channels.erase(it);
+            if (it != m_channels.end() && it->second == channel) m_channels.erase(it);  // channel still holds it
         }
         channel->Close();
     }

@@ -50,7 +50,7 @@ HRESULT CDispatchProxy::QueryInterface(REFIID iid, void** object) {
     *object = nullptr;
     if (iid == IID_IUnknown || iid == IID_IDispatch) {
         *object = static_cast<IDispatch*>(this);
-    } else if (!RemoteAnswers(iid)) {
+    } else if (iid == IID_IConnectionPoint || !RemoteAnswers(iid)) {  // connection points have proxies of their own
         return E_NOINTERFACE;
     } else if (iid == IID_IConnectionPointContainer) {
         *object = static_cast<IConnectionPointContainer*>(this);
