@@ -6,11 +6,35 @@
 
 #include <gtest/gtest.h>
 
+#include <dlfcn.h>
 #include <sys/stat.h>
 
+#include <atomic>
+#include <cerrno>
 #include <thread>
 
 namespace {
+std::atomic<bool> g_failRename{false};  // set: rename(2) fails, as on a file system that refuses it
+}  // namespace
+
+// Stands in for the C library's rename for the whole test program (the helper
+// library's calls resolve to it), so a test can make the replacement fail.
+extern "C" int rename(const char* from, const char* to) noexcept {
+    using Rename = int (*)(const char*, const char*);
+    static const auto real = reinterpret_cast<Rename>(dlsym(RTLD_NEXT, "rename"));
+    if (g_failRename) {
+        errno = EIO;
+        return -1;
+    }
+    return real(from, to);
+}
+
+namespace {
+
+struct FailingRename {
+    FailingRename() { g_failRename = true; }
+    ~FailingRename() { g_failRename = false; }
+};
 
 CString ReadText(const CString& file, LPCWSTR section, LPCWSTR key) {
     char16_t buffer[1024];
@@ -143,6 +167,30 @@ TEST_F(ProfileTest, SessionWritesOnceAtTheEnd) {
         ASSERT_TRUE(VX_WritePrivateProfileString(u"s", u"k", u"new", path));
     }
     EXPECT_EQ(ReadBytes(file), "[s]\nk=new\n");
+}
+
+TEST_F(ProfileTest, AFailedReplacementLeavesTheFileAsItWas) {
+    const std::string original = "[s]\r\nk=old\r\n";
+    WriteBytes(file, original);
+    {
+        VX_CPrivateProfileSession session(path);
+        ASSERT_TRUE(VX_WritePrivateProfileString(u"s", u"k", u"new", path));
+        ASSERT_TRUE(VX_WritePrivateProfileString(u"t", u"added", u"1", path));
+        {
+            FailingRename failing;
+            EXPECT_FALSE(session.Commit());
+        }
+        EXPECT_EQ(ReadText(path, u"s", u"k"), u"old");  // the changes are gone from the session too
+        EXPECT_TRUE(session.Commit());                   // nothing left to write
+    }  // the session's end must not write what the failed commit did not
+    EXPECT_EQ(ReadBytes(file), original);
+
+    {
+        FailingRename failing;
+        EXPECT_FALSE(VX_WritePrivateProfileString(u"s", u"k", u"new", path));
+    }
+    EXPECT_EQ(ReadBytes(file), original);
+    EXPECT_EQ(std::distance(std::filesystem::directory_iterator(dir.Path()), {}), 1);  // no temporary file left
 }
 
 TEST_F(ProfileTest, ConcurrentWritersLoseNothing) {

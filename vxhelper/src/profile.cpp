@@ -216,20 +216,33 @@ VX_CPrivateProfileSession::~VX_CPrivateProfileSession() {
     if (it != g_sessions.end() && --it->second.sessions == 0) g_sessions.erase(it);
 }
 
+namespace {
+
+// Drops a session's pending changes: it reads the file as it is now.
+void Reload(const std::string& path, ProfileFile& file) {
+    const int sessions = file.sessions;
+    file = Load(path);
+    file.sessions = sessions;
+}
+
+}  // namespace
+
 bool VX_CPrivateProfileSession::Commit() {
     std::lock_guard lock(g_lock);
     auto it = g_sessions.find(m_path);
     if (it == g_sessions.end() || !it->second.dirty) return true;
-    if (!it->second.writable || !Save(m_path, it->second.doc.Serialize())) return false;
-    it->second.dirty = false;
-    return true;
+    if (it->second.writable && Save(m_path, it->second.doc.Serialize())) {
+        it->second.dirty = false;
+        return true;
+    }
+    // A commit that failed never writes later (the session's end would retry
+    // it): a caller told that nothing was written must find the file unchanged.
+    Reload(m_path, it->second);
+    return false;
 }
 
 void VX_CPrivateProfileSession::Discard() {
     std::lock_guard lock(g_lock);
     auto it = g_sessions.find(m_path);
-    if (it == g_sessions.end()) return;
-    const int sessions = it->second.sessions;
-    it->second = Load(m_path);
-    it->second.sessions = sessions;
+    if (it != g_sessions.end()) Reload(m_path, it->second);
 }

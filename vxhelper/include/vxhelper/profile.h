@@ -62,8 +62,9 @@ public:
     VX_CPrivateProfileSession& operator=(const VX_CPrivateProfileSession&) = delete;
 
     // Writes pending changes to the file. True when nothing was pending or
-    // the file was replaced; false when it could not be (the changes stay
-    // pending for a later Commit).
+    // the file was replaced; false when it could not be: then the changes are
+    // dropped (as by Discard), so the file stays as it was, also when the
+    // session ends.
     bool Commit();
     // Drops pending changes: the session reads the file as it is now.
     void Discard();
