@@ -46,7 +46,7 @@ QWidget* MakeControl(QDialog& dialog, const DlgControl& control, QButtonGroup*& 
     }
     case DlgControlKind::Label: {
         auto* label = new QLabel(text, &dialog);
-        label->setAlignment(Qt::AlignLeft | Qt::AlignTop);
+        label->setAlignment(Qt::AlignLeft | Qt::AlignVCenter);
         return label;
     }
     case DlgControlKind::Edit: {

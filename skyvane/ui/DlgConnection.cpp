@@ -48,6 +48,8 @@ void CDlgConnection::DoDataExchange(bool save) {
     }
     m_editConnection->setText(ToQString(m_strConnection));
     m_editQueue->setText(ToQString(m_strQueue));
+    m_editConnection->setCursorPosition(0);  // a long connection text shows its start
+    m_editQueue->setCursorPosition(0);
     m_radioQueue->setChecked(m_nMode == 0);
     m_radioEventHub->setChecked(m_nMode == 1);
     m_comboFormat->setCurrentIndex(m_nFormat);

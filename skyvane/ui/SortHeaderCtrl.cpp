@@ -63,6 +63,7 @@ void CSortHeaderCtrl::paintSection(QPainter* painter, const QRect& rect, int log
     const int x = std::min(rect.left() + margin + fontMetrics().horizontalAdvance(title) + kArrowGap, right);
     if (x < rect.left()) return;
     painter->save();
+    painter->setClipRect(rect);  // the style may leave the painter clipped to the title
     painter->drawPixmap(x, rect.top() + (rect.height() - arrow.height()) / 2, arrow);
     painter->restore();
 }

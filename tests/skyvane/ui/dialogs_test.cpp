@@ -54,6 +54,35 @@ void ClickHeader(QTreeWidget* list) {
     QTest::mouseClick(header->viewport(), Qt::LeftButton, {}, QPoint(header->sectionSize(0) / 2, header->height() / 2));
 }
 
+// What the header's arrow adds to the header's picture, from the top left of
+// the changed pixels: g grey, s light grey, w white, . unchanged (transparent).
+std::vector<std::string> DrawnArrow(CSortHeaderCtrl* header) {
+    const QImage with = header->grab().toImage();
+    const int column = header->GetSortColumn();
+    const bool descending = header->IsDescending();
+    header->SetSortArrow(-1, false);  // takes the arrow away
+    const QImage without = header->grab().toImage();
+    header->SetSortArrow(column, descending);
+    QRect changed;
+    for (int y = 0; y < with.height(); ++y)
+        for (int x = 0; x < with.width(); ++x)
+            if (with.pixel(x, y) != without.pixel(x, y)) changed |= QRect(x, y, 1, 1);
+    std::vector<std::string> rows;
+    for (int y = changed.top(); changed.isValid() && y <= changed.bottom(); ++y) {
+        std::string row;
+        for (int x = changed.left(); x <= changed.right(); ++x) {
+            const QRgb pixel = with.pixel(x, y);
+            row += pixel == without.pixel(x, y)      ? '.'
+                   : pixel == qRgb(128, 128, 128) ? 'g'
+                   : pixel == qRgb(192, 192, 192) ? 's'
+                   : pixel == qRgb(255, 255, 255) ? 'w'
+                                                   : '?';
+        }
+        rows.push_back(row);
+    }
+    return rows;
+}
+
 void SetText(QWidget& dialog, UINT id, const QString& text) { Control<QLineEdit>(dialog, id)->setText(text); }
 
 CConnection* AddConnection(CAzureConfig& config, const char* text, const char* queue, bool eventHub, int format) {
@@ -188,9 +217,13 @@ TEST_F(SettingsDialogTest, DeselectingTheProjectEmptiesTheVariablesAndHeadersSor
     ClickHeader(variables);
     EXPECT_TRUE(header->IsDescending());
     EXPECT_EQ(header->GetColumnImage(0), 0);
+    EXPECT_EQ(DrawnArrow(header), (std::vector<std::string>{"ggggggggw", ".gsssssw.", ".gsssssw.", "..gsssw..",
+                                                            "..gsssw..", "...gsw...", "...gsw...", "....w...."}));
     EXPECT_EQ(Texts(variables), (std::vector<std::string>{"Temp", "Level", "Flow", "Beta", "alpha", "9", "10"}));
     ClickHeader(variables);
     EXPECT_EQ(header->GetColumnImage(0), 1);
+    EXPECT_EQ(DrawnArrow(header), (std::vector<std::string>{"....g....", "...gsw...", "...gsw...", "..gsssw..",
+                                                            "..gsssw..", ".gsssssw.", ".gsssssw.", "gwwwwwwww"}));
     EXPECT_EQ(Texts(variables), (std::vector<std::string>{"10", "9", "alpha", "Beta", "Flow", "Level", "Temp"}));
 
     // A click on empty space below the items.
