@@ -351,6 +351,9 @@ TEST_F(SettingsDialogTest, InactiveProjectDisablesTheVariableControlsUntilActive
     variables->topLevelItem(0)->setSelected(true);
 
     ASSERT_TRUE(runtime->SetProjectActive(u"Line2", false));  // fired on the stand-in's own thread
+    runtime->Flush();
+    // The event thread only posted: the widgets change on the dialog's thread.
+    EXPECT_TRUE(allEnabled(true));
     ASSERT_TRUE(PumpUntil([&] { return allEnabled(false); }));
     EXPECT_TRUE(Control(dlg, IDC_LIST_CONNECTIONS)->isEnabled());
     EXPECT_TRUE(Control(dlg, IDC_CANCEL)->isEnabled());
