@@ -5,6 +5,7 @@
 #include "frame/HostMessages.h"
 #include "frame/ModuleLog.h"
 #include "res/resource.h"
+#include "ui/SettingsDialog.h"
 
 #include "platform/resources.h"
 #include "vxhelper/messagebox.h"
@@ -30,7 +31,12 @@ int CMainSkyvane::Init(CConfigData* context) {
     return RunOnWindowThread([&] { return InitOnWindowThread(context); });
 }
 
-int CMainSkyvane::Konfig(CConfigData*) { return 0; }
+int CMainSkyvane::Konfig(CConfigData* context) {
+    return RunOnWindowThread([&] {
+        if (RunSettingsDialog(context) == 0) ExecActionOnWindowThread(GetConfigData());
+        return 0;
+    });
+}
 
 int CMainSkyvane::ExecAction(CConfigData* context) {
     return RunOnWindowThread([&] { return ExecActionOnWindowThread(context); });
@@ -77,6 +83,27 @@ int CMainSkyvane::DllExitOnWindowThread(int unused) {
     StopExport();
     m_hHostWnd.store(nullptr);
     return CMainAccess::DllExit(unused);
+}
+
+int CMainSkyvane::RunSettingsDialog(CConfigData* context) {
+    if (!context) return 1;
+    static VX_CRefCnt busy;  // held while the dialog is open: a second konfig returns at once
+    VX_ReentranceGuard guard(busy);
+    if (!guard.Entered()) return 2;
+    if (!CMainAccess::Konfig(context)) return 1;
+    CAzureConfig working(m_config);
+    if (ShowSettingsDialog(context->m_pWnd, working) != IDOK) return 1;
+    // dll_exit may have run in the dialog's message loop.
+    const CConfigData* copy = GetConfigData();
+    if (!copy) return 1;
+    // A refused write must not read as saved: the restart would read the old file.
+    if (!WriteConfig(copy->m_strIniFile, working)) {
+        CString text;
+        AfxLoadString(IDS_SETTINGS_NOT_SAVED, text);
+        VXHelper_MessageBox(SafeHwnd(copy->m_pWnd), CString::Formatted(text, copy->m_strIniFile), MB_ICONERROR);
+        return 1;
+    }
+    return 0;
 }
 
 void CMainSkyvane::PublishHostWindow() {

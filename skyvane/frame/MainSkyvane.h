@@ -35,7 +35,8 @@ public:
     ~CMainSkyvane() override;
 
     int Init(CConfigData* context) override;
-    // Does nothing yet and returns 0: the settings dialog is not built.
+    // Runs the settings dialog; when the settings were saved, applies them
+    // as ExecAction does. Always 0.
     int Konfig(CConfigData* context) override;
     int ExecAction(CConfigData* context) override;
     int DllExit(int unused) override;
@@ -69,6 +70,8 @@ private:
 
     int RunOnWindowThread(const std::function<int()>& body);
     int InitOnWindowThread(CConfigData* context);
+    // 0 saved, 1 not saved (cancelled, or the file could not be written), 2 already open.
+    int RunSettingsDialog(CConfigData* context);
     int ExecActionOnWindowThread(CConfigData* context);
     int DllExitOnWindowThread(int unused);
     void PublishHostWindow();

@@ -313,4 +313,20 @@ TEST_F(ModuleTest, ACheckRequestedWhileAMessageBoxIsOpenRunsWhenItCloses) {
     EXPECT_EQ(boxes.Texts(), std::vector<std::string>{"Variable is unknown:\nPlant#Level"});
 }
 
+TEST_F(ModuleTest, KonfigWithoutADesktopSaysSoAndChangesNothing) {
+    StartRuntime({Project(u"Plant", {u"Level"})});
+    WriteSettingsFile(SettingsPath(), {{"Plant#Level"}, {Target("values", 1)}});
+    const std::string before = TempFolder::Read(SettingsPath());
+    CMessageBoxRecorder boxes;
+    EXPECT_EQ(module.Konfig(&context), 0);  // before init: nothing to configure
+    EXPECT_TRUE(boxes.Texts().empty());
+    ASSERT_EQ(module.Init(&context), 1);
+    EXPECT_EQ(module.Konfig(&context), 0);
+    EXPECT_EQ(boxes.Texts(),
+              std::vector<std::string>{"The settings dialog needs a desktop session; the settings were not changed."});
+    EXPECT_EQ(TempFolder::Read(SettingsPath()), before);
+    Set(u"Plant", u"Level", 2.0);
+    ASSERT_TRUE(WaitForRows("values", 1, "Level"));
+}
+
 }  // namespace
