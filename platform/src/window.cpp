@@ -233,6 +233,12 @@ bool IsWindow(HWND window) {
     return g_windows.count(window) != 0;
 }
 
+void* GetNativeWidget(HWND window) {
+    std::lock_guard<std::mutex> guard(g_windowsLock);
+    auto it = g_windows.find(window);
+    return it == g_windows.end() ? nullptr : it->second.window->GetNativeWidget();
+}
+
 void VX_PumpMessages(DWORD milliseconds) {
     QDeadlineTimer deadline(static_cast<qint64>(milliseconds));
     do {

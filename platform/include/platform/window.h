@@ -39,15 +39,24 @@ public:
     virtual LRESULT WindowProc(UINT message, WPARAM wParam, LPARAM lParam);
     virtual LRESULT DefWindowProc(UINT message, WPARAM wParam, LPARAM lParam);
 
+    // The toolkit widget that shows this window, if any (a QWidget*, kept
+    // untyped so that module code never sees toolkit headers). Dialogs and
+    // message boxes parented to the window are parented to it.
+    void SetNativeWidget(void* widget) { m_pNativeWidget = widget; }
+    void* GetNativeWidget() const { return m_pNativeWidget; }
+
     HWND m_hWnd = nullptr;
 
 private:
     CString m_title;
+    void* m_pNativeWidget = nullptr;
 };
 
 bool PostMessage(HWND window, UINT message, WPARAM wParam = 0, LPARAM lParam = 0);
 LRESULT SendMessage(HWND window, UINT message, WPARAM wParam = 0, LPARAM lParam = 0);
 bool IsWindow(HWND window);
+// The native widget of a live window (see CWnd::SetNativeWidget), or null.
+void* GetNativeWidget(HWND window);
 // The handle of a window that may be null.
 inline HWND SafeHwnd(const CWnd* window) { return window ? window->m_hWnd : nullptr; }
 

@@ -5,6 +5,8 @@
 #include "platform/ticks.h"
 #include "tarvo/Control.h"
 
+#include "BulkArrays.h"
+
 #include <gtest/gtest.h>
 
 #include <atomic>
@@ -101,26 +103,6 @@ tarvo::RuntimeConfig PlantConfig() {
 
 // Holder cells as the bridge makes them; the link never reads through them.
 CVarItem** NewCell(std::uintptr_t tag) { return new CVarItem*(reinterpret_cast<CVarItem*>(tag)); }
-
-CComVariant ArrayOf(VARTYPE vt, LONG lowerBound, const std::vector<double>& numbers) {
-    SAFEARRAY* array = SafeArrayCreateVector(vt, lowerBound, static_cast<std::uint32_t>(numbers.size()));
-    for (size_t i = 0; i < numbers.size(); ++i) {
-        const LONG index = lowerBound + static_cast<LONG>(i);
-        if (vt == VT_VARIANT) {
-            CComVariant element(numbers[i]);
-            SafeArrayPutElement(array, &index, &element);
-        } else {
-            SafeArrayPutElement(array, &index, &numbers[i]);
-        }
-    }
-    VARIANT holder;
-    VariantInit(&holder);
-    holder.vt = VT_ARRAY | vt;
-    holder.parray = array;
-    CComVariant owned(holder);
-    VariantClear(&holder);
-    return owned;
-}
 
 class RuntimeLink : public ::testing::Test {
 protected:

@@ -1,0 +1,271 @@
+// The module driven through its four exports, as a host drives it: a
+// recording host window, a settings file, the runtime stand-in in process
+// and azure-local on loopback.
+#include "ModuleHost.h"
+
+#include "AzureLocalProcess.h"
+
+#include "automation/comvariant.h"
+
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <cmath>
+#include <map>
+#include <set>
+
+namespace {
+
+using azurelocal::AzureLocalProcess;
+using azurelocal::ReceivedRow;
+
+constexpr UINT kRowsFailed = WM_USER + 1, kStatus = WM_USER + 2, kRestartFailed = WM_USER + 102,
+               kInitBegin = WM_USER + 103;
+
+class ModuleTest : public ::testing::Test {
+protected:
+    void SetUp() override {
+        std::string error;
+        receiver = AzureLocalProcess::Start({}, error);
+        ASSERT_TRUE(receiver) << error;
+        ASSERT_TRUE(module.Loaded());
+        context.m_pWnd = &host;
+        context.m_strIniFile = CString(SettingsPath());
+    }
+
+    void TearDown() override {
+        module.DllExit();
+        if (runtime) runtime->Stop();
+    }
+
+    std::string SettingsPath() const { return folder.Path("skyvane.ini"); }
+
+    void StartRuntime(std::vector<tarvo::ProjectConfig> projects) {
+        tarvo::RuntimeConfig config;
+        config.projects = std::move(projects);
+        tarvo::RuntimeOptions options;
+        options.simulate = false;  // values change only when a test sets them
+        runtime = std::make_unique<tarvo::Runtime>(config, options);
+        std::string error;
+        ASSERT_TRUE(runtime->Start(&error)) << error;
+    }
+
+    TargetSettings Target(const std::string& queue, int format, bool eventHub = false) const {
+        return {receiver->ConnectionString(), queue, eventHub, format};
+    }
+
+    void Set(const std::u16string& project, const std::u16string& variable, double value, ULONGLONG status = 0) {
+        ASSERT_TRUE(runtime->SetValue(project, variable, CComVariant(value), status, 45000.5));
+    }
+
+    std::vector<ReceivedRow> RowsOf(const std::string& entity, const std::string& variable = {}) {
+        std::vector<ReceivedRow> rows;
+        for (ReceivedRow& r : receiver->Rows()) {
+            if (r.entity == entity && (variable.empty() || r.row.variable == variable)) rows.push_back(std::move(r));
+        }
+        return rows;
+    }
+
+    bool WaitForRows(const std::string& entity, size_t count, const std::string& variable = {}) {
+        return PumpUntil([&] { return RowsOf(entity, variable).size() >= count; });
+    }
+
+    TempFolder folder;
+    CTestLog log{folder};
+    std::unique_ptr<AzureLocalProcess> receiver;
+    std::unique_ptr<tarvo::Runtime> runtime;
+    CRecordingHostWnd host;
+    CConfigData context;
+    CModuleUnderTest module;
+};
+
+TEST_F(ModuleTest, ValuesReachEveryTargetInItsFormatOnlyWhenTheyChange) {
+    StartRuntime({Project(u"Plant", {u"Level", u"Flow", u"Idle"})});
+    WriteSettingsFile(SettingsPath(), {{"Plant#Level", "Plant#Flow", "Plant#Idle"},
+                                       {Target("values", 1), Target("hub", 2, true), Target("xml", 0)}});
+    ASSERT_EQ(module.Init(&context), 1);
+    const auto messages = host.Messages();
+    ASSERT_GE(messages.size(), 2u);
+    EXPECT_EQ(messages[0].message, kInitBegin);
+    EXPECT_EQ(messages[0].wParam, 1u);
+    EXPECT_EQ(messages[1].message, kStatus);
+    EXPECT_EQ(messages[1].wParam, 0u);
+
+    // The first cycle is a full send, but nothing has a value yet.
+    ASSERT_TRUE(PumpUntil([&] { return host.Count(kStatus) >= 2; }));
+    EXPECT_TRUE(receiver->Rows().empty());
+
+    Set(u"Plant", u"Level", 12.5);
+    for (const char* entity : {"values", "hub", "xml"}) ASSERT_TRUE(WaitForRows(entity, 1)) << entity;
+    for (const auto& [entity, format] : std::map<std::string, std::string>{{"values", "JSON"}, {"hub", "BOND"}, {"xml", "XML"}}) {
+        const auto rows = RowsOf(entity);
+        ASSERT_EQ(rows.size(), 1u) << entity;
+        EXPECT_EQ(rows[0].format, format);
+        EXPECT_EQ(rows[0].row.project, "Plant");
+        EXPECT_EQ(rows[0].row.variable, "Level");
+        EXPECT_DOUBLE_EQ(rows[0].row.value, 12.5);
+    }
+
+    // The same value and status again is no change; a status of its own is.
+    // Flow's row marks the point by which the repeat would have arrived.
+    Set(u"Plant", u"Level", 12.5);
+    Set(u"Plant", u"Flow", 3.0);
+    ASSERT_TRUE(WaitForRows("values", 1, "Flow"));
+    EXPECT_EQ(RowsOf("values", "Level").size(), 1u);
+    Set(u"Plant", u"Level", 12.5, 0x80000000ull << 32 | 7);
+    ASSERT_TRUE(WaitForRows("values", 2, "Level"));
+    EXPECT_EQ(RowsOf("values", "Level").back().row.status, 0x80000000ull << 32 | 7);
+    EXPECT_TRUE(RowsOf("values", "Idle").empty());
+}
+
+TEST_F(ModuleTest, IntegrityPeriodResendsEveryValidVariable) {
+    StartRuntime({Project(u"Plant", {u"Level", u"Idle"})});
+    ModuleSettings settings{{"Plant#Level", "Plant#Idle"}, {Target("values", 1)}};
+    settings.integrityPeriod = 1;
+    WriteSettingsFile(SettingsPath(), settings);
+    ASSERT_EQ(module.Init(&context), 1);
+    Set(u"Plant", u"Level", 4.0);
+    const auto start = std::chrono::steady_clock::now();
+    ASSERT_TRUE(WaitForRows("values", 4, "Level"));
+    const double seconds = std::chrono::duration<double>(std::chrono::steady_clock::now() - start).count();
+    // One change and at least three full sends, each a period apart: never one a cycle.
+    EXPECT_GE(seconds, 1.5);
+    EXPECT_LE(RowsOf("values", "Level").size(), static_cast<size_t>(seconds) + 3);
+    EXPECT_TRUE(RowsOf("values", "Idle").empty());
+}
+
+TEST_F(ModuleTest, UnknownVariablesAreListedLastFirstUnderTheirHeading) {
+    StartRuntime({Project(u"Plant", {u"Level"})});
+    CMessageBoxRecorder boxes;
+    for (int unknown : {1, 10, 11}) {
+        ModuleSettings settings{{"Plant#Level"}, {Target("values", 1)}};
+        for (int i = 0; i < unknown; ++i) settings.variables.push_back("Plant#Missing" + std::to_string(10 + i));
+        WriteSettingsFile(SettingsPath(), settings);
+        EXPECT_EQ(module.Init(&context), 0) << unknown;
+    }
+    const auto texts = boxes.Texts();
+    ASSERT_EQ(texts.size(), 3u);
+    EXPECT_EQ(texts[0], "Variable is unknown:\nPlant#Missing10");
+    std::string ten = "The listed variables are unknown:\n";
+    for (int i = 19; i >= 10; --i) ten += "Plant#Missing" + std::to_string(i) + (i > 10 ? ", " : "");
+    EXPECT_EQ(texts[1], ten);
+    // Map order puts Missing10..Missing20 in key order; the first ten refused are shown, the last first.
+    std::string many = "Many variables are unknown, some are listed:\n";
+    for (int i = 19; i >= 10; --i) many += "Plant#Missing" + std::to_string(i) + (i > 10 ? ", " : "");
+    EXPECT_EQ(texts[2], many);
+}
+
+TEST_F(ModuleTest, ALinkThatCannotStartOrNoRuntimeShowsTheConnectionFailure) {
+    CMessageBoxRecorder boxes;
+    WriteSettingsFile(SettingsPath(), {{"Plant#Level"}, {Target("values", 1)}});
+    EXPECT_EQ(module.Init(&context), 0);  // no runtime at all
+    StartRuntime({Project(u"Plant", {u"Level"})});
+    runtime->SetStartFails(true);
+    EXPECT_EQ(module.Init(&context), 0);
+    runtime->SetStartFails(false);
+    EXPECT_EQ(module.Init(&context), 1);
+    EXPECT_EQ(boxes.Texts(), std::vector<std::string>(2, "Connection to SCADA system failed!"));
+}
+
+TEST_F(ModuleTest, ProjectsSwitchedInactiveAndActiveAreSubscribedAgain) {
+    StartRuntime({Project(u"Plant", {u"Level"}), Project(u"Line2", {u"Speed"})});
+    CMessageBoxRecorder boxes;
+    WriteSettingsFile(SettingsPath(), {{"Plant#Level", "Line2#Speed"}, {Target("values", 1)}});
+    ASSERT_EQ(module.Init(&context), 1);
+
+    ASSERT_TRUE(runtime->SetProjectActive(u"Plant", false));
+    // The other project's values keep flowing while Plant is inactive.
+    ASSERT_TRUE(PumpUntil([&] {
+        Set(u"Line2", u"Speed", static_cast<double>(RowsOf("values", "Speed").size() + 1));
+        return RowsOf("values", "Speed").size() >= 3;
+    }));
+    ASSERT_TRUE(runtime->SetProjectActive(u"Plant", true));
+    ASSERT_TRUE(runtime->SetProjectActive(u"Plant", true));  // a second "Active" in a row
+    double level = 0;
+    ASSERT_TRUE(PumpUntil([&] {
+        Set(u"Plant", u"Level", ++level);
+        return RowsOf("values", "Level").size() >= 2;
+    }));
+    EXPECT_TRUE(boxes.Texts().empty());
+    EXPECT_EQ(log.CountContaining("fail!"), 0);
+}
+
+TEST_F(ModuleTest, ExecActionAppliesNewSettingsAndReportsAFailedRestart) {
+    StartRuntime({Project(u"Plant", {u"Level", u"Flow"})});
+    EXPECT_EQ(module.ExecAction(&context), 0);  // before init
+    WriteSettingsFile(SettingsPath(), {{"Plant#Level", "Plant#Flow"}, {Target("values", 1)}});
+    ASSERT_EQ(module.Init(&context), 1);
+
+    WriteSettingsFile(SettingsPath(), {{"Plant#Level"}, {Target("values", 1), Target("added", 2, true)}});
+    EXPECT_EQ(module.ExecAction(&context), 1);
+    Set(u"Plant", u"Flow", 9.0);
+    Set(u"Plant", u"Level", 1.0);
+    ASSERT_TRUE(WaitForRows("added", 1, "Level"));
+    ASSERT_TRUE(WaitForRows("values", 1, "Level"));
+    EXPECT_TRUE(RowsOf("values", "Flow").empty());
+
+    CMessageBoxRecorder boxes;
+    WriteSettingsFile(SettingsPath(), {{"Plant#Nowhere"}, {Target("values", 1)}});
+    EXPECT_EQ(module.ExecAction(&context), 1);
+    ASSERT_TRUE(PumpUntil([&] { return host.Count(kRestartFailed) == 1; }));
+    EXPECT_EQ(boxes.Texts().size(), 1u);
+}
+
+TEST_F(ModuleTest, DllExitEndsTheExportAndInitWorksAgain) {
+    StartRuntime({Project(u"Plant", {u"Level"})});
+    WriteSettingsFile(SettingsPath(), {{"Plant#Level"}, {Target("values", 1)}});
+    ASSERT_EQ(module.Init(&context), 1);
+    EXPECT_EQ(module.DllExit(), 1);
+    Set(u"Plant", u"Level", 5.0);
+    host.Clear();
+    VX_PumpMessages(300);  // ticks arrive and must do nothing
+    EXPECT_TRUE(host.Messages().empty());
+    EXPECT_TRUE(receiver->Rows().empty());
+    EXPECT_EQ(module.ExecAction(&context), 0);
+
+    ASSERT_EQ(module.Init(&context), 1);
+    Set(u"Plant", u"Level", 6.0);
+    ASSERT_TRUE(WaitForRows("values", 1, "Level"));
+    EXPECT_DOUBLE_EQ(RowsOf("values", "Level").back().row.value, 6.0);
+}
+
+TEST_F(ModuleTest, ARetriedSendLosesNothingAndRefusedRowsAreReportedWithTheKeyMasked) {
+    StartRuntime({Project(u"Plant", {u"Level"})});
+    WriteSettingsFile(SettingsPath(), {{"Plant#Level"}, {Target("values", 1)}});
+    ASSERT_EQ(module.Init(&context), 1);
+
+    ASSERT_TRUE(receiver->Fault("kind=status&status=503&count=1&retry-after-ms=100"));
+    Set(u"Plant", u"Level", 1.0);
+    ASSERT_TRUE(WaitForRows("values", 1, "Level"));
+
+    ASSERT_TRUE(receiver->Fault("kind=status&status=400&count=1"));
+    Set(u"Plant", u"Level", 2.0);
+    ASSERT_TRUE(PumpUntil([&] { return host.Count(kRowsFailed) == 1; }));
+    module.DllExit();  // flushes the log
+    const std::string masked = "SharedAccessKey=***";
+    EXPECT_EQ(log.CountContaining("Adding of 1 Online Rows failed for 'Endpoint=sb://127.0.0.1:"), 1);
+    EXPECT_GE(log.CountContaining(masked), 2);  // the failure and at least one success
+    EXPECT_EQ(log.CountContaining(AzureLocalProcess::kKey), 0);
+}
+
+TEST_F(ModuleTest, EveryTargetGetsTheSameRowsAndTheStatusCountsThemAll) {
+    StartRuntime({Project(u"Plant", {u"A", u"B", u"C", u"D"})});
+    WriteSettingsFile(SettingsPath(), {{"Plant#A", "Plant#B", "Plant#C", "Plant#D"},
+                                       {Target("first", 1), Target("second", 0)}});
+    ASSERT_EQ(module.Init(&context), 1);
+    // The first send waits a second for its retry; the next three changes
+    // queue meanwhile and go out together.
+    ASSERT_TRUE(receiver->Fault("kind=status&status=503&count=1&retry-after=1"));
+    Set(u"Plant", u"D", 1.0);
+    ASSERT_TRUE(PumpUntil([&] { return receiver->Stats().requests >= 1; }));
+    Set(u"Plant", u"A", 1.0);
+    Set(u"Plant", u"B", 1.0);
+    Set(u"Plant", u"C", 1.0);
+    ASSERT_TRUE(WaitForRows("second", 4));
+    EXPECT_EQ(RowsOf("first").size(), 4u);
+    const auto messages = host.Messages();
+    EXPECT_TRUE(std::any_of(messages.begin(), messages.end(),
+                            [](const auto& m) { return m.message == kStatus && m.wParam == 6; }));
+}
+
+}  // namespace
