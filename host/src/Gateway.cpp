@@ -9,6 +9,7 @@
 #include <QSaveFile>
 
 #include <cerrno>
+#include <cmath>
 #include <cstdio>
 #include <cstring>
 #include <ctime>
@@ -104,6 +105,7 @@ CGateway::~CGateway() {
 bool CGateway::Start() {
     if (!m_options.metricsFile.empty() && !WriteMetrics()) return false;
     m_statusTimer.start(Milliseconds(m_options.statusInterval));
+    m_intervalClock.start();
     if (m_options.duration > 0) m_durationTimer.start(Milliseconds(m_options.duration));
     if (!m_options.projectFile.empty()) {
         if (m_options.simulateDelay > 0) {
@@ -261,7 +263,11 @@ int CGateway::Configure() {
     return 0;
 }
 
-void CGateway::PrintStatus() { GatewaySay(m_status.TakeIntervalLine(m_options.statusInterval)); }
+void CGateway::PrintStatus() {
+    // The last line, at a stop, covers less than a whole interval.
+    const double seconds = std::round(static_cast<double>(m_intervalClock.restart()) / 100) / 10;
+    GatewaySay(m_status.TakeIntervalLine(seconds));
+}
 
 bool CGateway::WriteMetrics() {
     if (m_options.metricsFile.empty()) return true;

@@ -14,6 +14,7 @@
 #include "frame/ConfigData.h"
 #include "tarvo/Config.h"
 
+#include <QElapsedTimer>
 #include <QTimer>
 
 #include <memory>
@@ -76,6 +77,7 @@ private:
     QTimer m_statusTimer;
     QTimer m_durationTimer;
     QTimer m_runtimeTimer;
+    QElapsedTimer m_intervalClock;  // since the last status line
 
     bool m_bRunning = false;         // init returned 1 and dll_exit has not been called since
     bool m_bInInit = false;          // inside the init call: its closing 1026 is no cycle

@@ -11,6 +11,7 @@
 #include <algorithm>
 #include <csignal>
 #include <functional>
+#include <regex>
 #include <string>
 #include <vector>
 
@@ -92,3 +93,27 @@ private:
     size_t m_nextLine = 0;
     std::string m_partial;
 };
+
+// Sums of the status lines: rows, failed cycles, cycles.
+struct Sums {
+    unsigned long long rows = 0, failed = 0, cycles = 0, lines = 0;
+};
+inline Sums SumStatusLines(const std::vector<std::string>& lines) {
+    static const std::regex status(R"(status: (\d+) rows sent, (\d+) failed cycles, (\d+) cycles, longest cycle \d+ ms)");
+    Sums sums;
+    for (const std::string& line : lines) {
+        std::smatch m;
+        if (!std::regex_search(line, m, status)) continue;
+        sums.rows += std::stoull(m[1]);
+        sums.failed += std::stoull(m[2]);
+        sums.cycles += std::stoull(m[3]);
+        ++sums.lines;
+    }
+    return sums;
+}
+
+// A status line that counts at least one row sent.
+inline bool IsStatusWithRows(const std::string& line) {
+    const size_t at = line.find("status: ");
+    return at != std::string::npos && line.compare(at, 10, "status: 0 ") != 0;
+}

@@ -7,7 +7,6 @@
 
 #include <cstdlib>
 #include <map>
-#include <regex>
 #include <string>
 
 namespace {
@@ -25,24 +24,6 @@ std::vector<std::string> Calls(const TempFolder& folder) {
 }
 
 bool StartsWith(const std::string& text, const std::string& start) { return text.rfind(start, 0) == 0; }
-
-// Sums of the status lines: rows, failed cycles, cycles.
-struct Sums {
-    unsigned long long rows = 0, failed = 0, cycles = 0, lines = 0;
-};
-Sums SumStatusLines(const std::vector<std::string>& lines) {
-    static const std::regex status(R"(status: (\d+) rows sent, (\d+) failed cycles, (\d+) cycles, longest cycle \d+ ms)");
-    Sums sums;
-    for (const std::string& line : lines) {
-        std::smatch m;
-        if (!std::regex_search(line, m, status)) continue;
-        sums.rows += std::stoull(m[1]);
-        sums.failed += std::stoull(m[2]);
-        sums.cycles += std::stoull(m[3]);
-        ++sums.lines;
-    }
-    return sums;
-}
 
 // The metrics file read by the Prometheus client library: sample name to value.
 std::map<std::string, double> ParseMetrics(const std::string& file, std::string& output) {
