@@ -7,21 +7,21 @@ namespace {
 
 constexpr double kLongestSeconds = 2000000;  // about 23 days: every timer interval stays within 32-bit milliseconds
 
-struct OptionSpec {
+struct OptionInfo {
     const char* name;
     bool forRun;        // run accepts it
     bool forConfigure;  // configure accepts it
 };
 
-constexpr OptionSpec kOptions[] = {
+constexpr OptionInfo kOptions[] = {
     {"--ini", true, true},           {"--simulate", true, true},        {"--simulate-delay", true, true},
     {"--module", true, true},        {"--duration", true, false},       {"--status-interval", true, false},
     {"--metrics-file", true, false},
 };
 
-const OptionSpec* FindOption(const std::string& name) {
-    for (const OptionSpec& spec : kOptions)
-        if (name == spec.name) return &spec;
+const OptionInfo* FindOption(const std::string& name) {
+    for (const OptionInfo& info : kOptions)
+        if (name == info.name) return &info;
     return nullptr;
 }
 
@@ -87,10 +87,10 @@ bool ParseGatewayOptions(const std::vector<std::string>& arguments, GatewayOptio
             name.resize(equals);
             hasValue = true;
         }
-        const OptionSpec* spec = FindOption(name);
-        const bool accepted = spec && (options.command == GatewayCommand::Run ? spec->forRun : spec->forConfigure);
+        const OptionInfo* info = FindOption(name);
+        const bool accepted = info && (options.command == GatewayCommand::Run ? info->forRun : info->forConfigure);
         if (!accepted) {
-            error = spec ? name + " does not apply to " + command
+            error = info ? name + " does not apply to " + command
                          : "unknown " + std::string(name.rfind("-", 0) == 0 ? "option" : "argument") + " '" + name +
                                "' (see --help)";
             return false;
