@@ -14,7 +14,7 @@ struct OptionInfo {
 };
 
 constexpr OptionInfo kOptions[] = {
-    {"--ini", true, true},           {"--simulate", true, true},        {"--simulate-delay", true, true},
+    {"--ini", true, true},           {"--simulate", true, true},        {"--simulate-delay", true, false},
     {"--module", true, true},        {"--duration", true, false},       {"--status-interval", true, false},
     {"--metrics-file", true, false},
 };
