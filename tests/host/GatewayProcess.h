@@ -10,8 +10,8 @@
 
 #include <algorithm>
 #include <csignal>
+#include <cstdio>
 #include <functional>
-#include <regex>
 #include <string>
 #include <vector>
 
@@ -99,14 +99,17 @@ struct Sums {
     unsigned long long rows = 0, failed = 0, cycles = 0, lines = 0;
 };
 inline Sums SumStatusLines(const std::vector<std::string>& lines) {
-    static const std::regex status(R"(status: (\d+) rows sent, (\d+) failed cycles, (\d+) cycles, longest cycle \d+ ms)");
     Sums sums;
     for (const std::string& line : lines) {
-        std::smatch m;
-        if (!std::regex_search(line, m, status)) continue;
-        sums.rows += std::stoull(m[1]);
-        sums.failed += std::stoull(m[2]);
-        sums.cycles += std::stoull(m[3]);
+        const size_t at = line.find("status: ");
+        unsigned long long rows, failed, cycles;
+        if (at == std::string::npos ||
+            std::sscanf(line.c_str() + at, "status: %llu rows sent, %llu failed cycles, %llu cycles", &rows, &failed,
+                        &cycles) != 3)
+            continue;
+        sums.rows += rows;
+        sums.failed += failed;
+        sums.cycles += cycles;
         ++sums.lines;
     }
     return sums;
