@@ -1,6 +1,6 @@
 #!/usr/bin/env bash
 # Builds and runs a libFuzzer target with clang (ASan + UBSan):
-#   bash fuzz/run.sh [target] [seconds]      e.g. bash fuzz/run.sh ini 60
+#   bash fuzz/run.sh [target] [seconds]      e.g. bash fuzz/run.sh ini 60 (targets: ini, wire)
 # Needs clang and the libFuzzer runtime (Debian: clang, libclang-rt-14-dev).
 # Builds into build/fuzz; the normal build and the tests do not use it.
 set -euo pipefail

@@ -1,10 +1,10 @@
 #include "platform/window.h"
 
 #include <QCoreApplication>
-#include <QDeadlineTimer>
 #include <QEvent>
 #include <QEventLoop>
 #include <QObject>
+#include <QTimer>
 #include <QTimerEvent>
 
 #include <atomic>
@@ -239,11 +239,12 @@ void* GetNativeWidget(HWND window) {
     return it == g_windows.end() ? nullptr : it->second.window->GetNativeWidget();
 }
 
+// A nested loop that a timer ends: the thread sleeps in the event loop's wait
+// between events rather than spinning through empty passes.
 void VX_PumpMessages(DWORD milliseconds) {
-    QDeadlineTimer deadline(static_cast<qint64>(milliseconds));
-    do {
-        QCoreApplication::processEvents(QEventLoop::AllEvents, static_cast<int>(std::max<qint64>(1, deadline.remainingTime())));
-    } while (!deadline.hasExpired());
+    QEventLoop loop;
+    QTimer::singleShot(std::chrono::milliseconds(milliseconds), Qt::PreciseTimer, &loop, &QEventLoop::quit);
+    loop.exec();
 }
 
 struct CNestedLoop::Impl {

@@ -179,7 +179,7 @@ LRESULT CMainSkyvane::WindowProc(UINT message, WPARAM wParam, LPARAM lParam) {
     case WM_SKYVANE_CHECK_VARIABLES:
         return CheckVariables(wParam, lParam);
     case WM_SKYVANE_RUN_ON_WINDOW_THREAD:
-        return (*reinterpret_cast<const std::function<int()>*>(lParam))();
+        return lParam ? (*reinterpret_cast<const std::function<int()>*>(lParam))() : 0;
     default:
         break;
     }

@@ -158,7 +158,7 @@ std::vector<Event> Engine::Tick(DWORD tickMs) {
     return events;
 }
 
-bool Engine::SetValue(const std::u16string& projectName, const std::u16string& variable, const VARIANT& value,
+bool Engine::SetValue(const std::u16string& projectName, const std::u16string& variable, const VARIANT* value,
                       const ULONGLONG* status, DATE time, std::vector<Event>* events) {
     const auto project = FindProject(projectName);
     if (!project) return false;
@@ -166,10 +166,12 @@ bool Engine::SetValue(const std::u16string& projectName, const std::u16string& v
     if (found == project->byName.end()) return false;
     std::lock_guard lock(m_lock);
     VariableState& v = project->variables[found->second];
-    v.value = CComVariant(value);
-    // Generators go on from a number that was set.
-    if (value.vt == VT_R8) v.number = value.dblVal;
-    if (value.vt == VT_I4) v.number = value.lVal;
+    if (value) {
+        v.value = CComVariant(*value);
+        // Generators go on from a number that was set.
+        if (value->vt == VT_R8) v.number = value->dblVal;
+        if (value->vt == VT_I4) v.number = value->lVal;
+    }
     if (status) v.status = *status;
     v.time = time;
     if (!project->active) return true;

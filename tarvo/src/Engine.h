@@ -93,7 +93,8 @@ public:
     // Advances the simulated clock and the generators by one tick; the events
     // of the started containers whose names changed.
     std::vector<Event> Tick(DWORD tickMs);
-    bool SetValue(const std::u16string& project, const std::u16string& variable, const VARIANT& value,
+    // A null value keeps the variable's value (a change of status only).
+    bool SetValue(const std::u16string& project, const std::u16string& variable, const VARIANT* value,
                   const ULONGLONG* status, DATE time, std::vector<Event>* events);
     bool SetProjectActive(const std::u16string& project, bool active, std::vector<Event>* events);
     bool RawBulkChange(const std::u16string& project, const std::u16string& container,

@@ -182,7 +182,7 @@ bool Runtime::SetValue(const std::u16string& project, const std::u16string& vari
                        ULONGLONG status, DATE time) {
     const auto engine = m->CurrentEngine();
     std::vector<Event> events;
-    if (!engine || !engine->SetValue(project, variable, value, &status, time, &events)) return false;
+    if (!engine || !engine->SetValue(project, variable, &value, &status, time, &events)) return false;
     m->Dispatch(std::move(events));
     return true;
 }
@@ -190,7 +190,15 @@ bool Runtime::SetValue(const std::u16string& project, const std::u16string& vari
 bool Runtime::SetValue(const std::u16string& project, const std::u16string& variable, const VARIANT& value) {
     const auto engine = m->CurrentEngine();
     std::vector<Event> events;
-    if (!engine || !engine->SetValue(project, variable, value, nullptr, NowAsOleDate(), &events)) return false;
+    if (!engine || !engine->SetValue(project, variable, &value, nullptr, NowAsOleDate(), &events)) return false;
+    m->Dispatch(std::move(events));
+    return true;
+}
+
+bool Runtime::SetStatus(const std::u16string& project, const std::u16string& variable, ULONGLONG status) {
+    const auto engine = m->CurrentEngine();
+    std::vector<Event> events;
+    if (!engine || !engine->SetValue(project, variable, nullptr, &status, NowAsOleDate(), &events)) return false;
     m->Dispatch(std::move(events));
     return true;
 }

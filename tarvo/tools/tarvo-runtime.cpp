@@ -1,13 +1,17 @@
 // tarvo-runtime: runs the SCADA runtime stand-in from a project file until
-// SIGINT or SIGTERM. With --watch it also subscribes every variable of every
-// project through the automation interface, as a client would, and prints
-// how many changes arrived every five seconds.
+// SIGINT or SIGTERM, reachable from other processes of the user through the
+// local-socket transport (its application object and its control object).
+// With --watch it also subscribes every variable of every project through the
+// automation interface, as a client would, and prints how many changes
+// arrived every five seconds. Messages go to standard error.
 #include "automation/connection.h"
 #include "automation/dispatch_call.h"
 #include "automation/dispatch_object.h"
+#include "automation/local_socket.h"
 #include "automation/rot.h"
 #include "platform/text.h"
 #include "tarvo/Control.h"
+#include "tarvo/ControlIds.h"
 
 #include <atomic>
 #include <csignal>
@@ -101,21 +105,55 @@ void Unwatch(std::vector<Watch>& watches) {
     watches.clear();
 }
 
+const char kHelp[] =
+    "usage: tarvo-runtime PROJECT_FILE [--watch] [--paused] [--socket-dir DIR]\n"
+    "Runs the SCADA runtime stand-in until SIGINT or SIGTERM.\n"
+    "  --watch           subscribe every variable and print the changes every 5 s\n"
+    "  --paused          start with the simulation paused (tarvo-ctl can drive it)\n"
+    "  --socket-dir DIR  folder of the sockets (default: $SKYVANE_AUTOMATION_DIR,\n"
+    "                    else $XDG_RUNTIME_DIR/skyvane-automation, else\n"
+    "                    /tmp/skyvane-automation-UID)\n";
+
 int Usage() {
-    std::fprintf(stderr, "usage: tarvo-runtime PROJECT_FILE [--watch]\n");
+    std::fputs(kHelp, stderr);
     return 2;
 }
+
+struct Options {
+    std::string file;
+    bool watch = false;
+    bool paused = false;
+    std::string socketDir;
+};
+
+bool ParseOptions(int argc, char** argv, Options* options) {
+    for (int i = 1; i < argc; ++i) {
+        const std::string arg = argv[i];
+        if (arg == "--watch") options->watch = true;
+        else if (arg == "--paused") options->paused = true;
+        else if (arg == "--socket-dir" && i + 1 < argc) options->socketDir = argv[++i];
+        else if (!arg.empty() && arg[0] != '-' && options->file.empty()) options->file = arg;
+        else return false;
+    }
+    return !options->file.empty();
+}
+
+void LogLine(const std::string& text) { std::fprintf(stderr, "tarvo-runtime: %s\n", text.c_str()); }
 
 }  // namespace
 
 int main(int argc, char** argv) {
-    if (argc < 2 || argc > 3 || (argc == 3 && std::strcmp(argv[2], "--watch") != 0)) return Usage();
-    const bool watchChanges = argc == 3;
+    if (argc == 2 && (std::strcmp(argv[1], "--help") == 0 || std::strcmp(argv[1], "-h") == 0)) {
+        std::fputs(kHelp, stdout);
+        return 0;
+    }
+    Options options;
+    if (!ParseOptions(argc, argv, &options)) return Usage();
 
     tarvo::RuntimeConfig config;
     std::string error;
-    if (!tarvo::LoadProjectFile(argv[1], &config, &error)) {
-        std::fprintf(stderr, "tarvo-runtime: %s\n", error.c_str());
+    if (!tarvo::LoadProjectFile(options.file, &config, &error)) {
+        LogLine(error);
         return 1;
     }
 
@@ -127,17 +165,30 @@ int main(int argc, char** argv) {
     pthread_sigmask(SIG_BLOCK, &signals, nullptr);
 
     tarvo::Runtime runtime(config);
+    runtime.SetSimulationPaused(options.paused);
     if (!runtime.Start(&error)) {
-        std::fprintf(stderr, "tarvo-runtime: %s\n", error.c_str());
+        LogLine(error);
+        return 1;
+    }
+    LocalSocketOptions socket;
+    socket.folder = options.socketDir;
+    socket.log = LogLine;
+    CComPtr<IDispatch> control = runtime.ControlObject();
+    DWORD applicationServer = 0, controlServer = 0;
+    if (FAILED(RegisterLocalServer(runtime.Application().Get(), CLSID_TarvoApplication, socket, &applicationServer, &error)) ||
+        FAILED(RegisterLocalServer(control.Get(), CLSID_TarvoControl, socket, &controlServer, &error))) {
+        LogLine(error);
+        if (applicationServer) RevokeLocalServer(applicationServer);
+        runtime.Stop();
         return 1;
     }
     size_t variables = 0;
     for (const auto& project : config.projects) variables += project.variables.size();
-    std::printf("tarvo-runtime: %zu projects, %zu variables, tick %u ms; stop with Ctrl+C\n", config.projects.size(),
-                variables, static_cast<unsigned>(config.tickMs));
-    std::fflush(stdout);
+    LogLine(std::to_string(config.projects.size()) + " projects, " + std::to_string(variables) + " variables, tick " +
+            std::to_string(config.tickMs) + " ms");
+    LogLine("ready, sockets in " + LocalSocketFolder(socket) + "; stop with Ctrl+C");
 
-    std::vector<Watch> watches = watchChanges ? WatchAll() : std::vector<Watch>{};
+    std::vector<Watch> watches = options.watch ? WatchAll() : std::vector<Watch>{};
     const timespec period{5, 0};
     int signal = -1;
     while (signal < 0) {
@@ -147,8 +198,12 @@ int main(int argc, char** argv) {
         }
         std::fflush(stdout);
     }
+    // Clients see the connection go first, then the runtime stops.
+    RevokeLocalServer(controlServer);
+    RevokeLocalServer(applicationServer);
+    control.Release();
     Unwatch(watches);
     runtime.Stop();
-    std::printf("tarvo-runtime: stopped (%s)\n", signal == SIGINT ? "SIGINT" : "SIGTERM");
+    LogLine(std::string("stopped (") + (signal == SIGINT ? "SIGINT" : "SIGTERM") + ")");
     return 0;
 }

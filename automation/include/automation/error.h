@@ -14,6 +14,10 @@
 constexpr HRESULT DISP_E_NONAMEDARGS = static_cast<HRESULT>(0x80020007u);
 // The object's server has stopped; the object no longer works.
 constexpr HRESULT RPC_E_DISCONNECTED = static_cast<HRESULT>(0x80010108u);
+// A call to another process got no answer within its time-out.
+constexpr HRESULT RPC_E_TIMEOUT = static_cast<HRESULT>(0x8001011Fu);
+// The object named in a call to another process is not (or no longer) there.
+constexpr HRESULT CO_E_OBJNOTCONNECTED = static_cast<HRESULT>(0x800401FDu);
 
 class CAutomationError : public std::exception {
 public:

@@ -83,6 +83,8 @@ public:
                   ULONGLONG status, DATE time);
     // As above with the status kept and the current time.
     bool SetValue(const std::u16string& project, const std::u16string& variable, const VARIANT& value);
+    // Sets a variable's status (value kept, time now) and fires the change as SetValue does.
+    bool SetStatus(const std::u16string& project, const std::u16string& variable, ULONGLONG status);
     // Switches a project and fires "Active" or "Inactive" (also when it already
     // was in that state). An active project sends all current values of its
     // started containers at the next tick. False for an unknown project.
@@ -109,6 +111,11 @@ public:
 
     // Automation objects of every runtime in this process that are still alive.
     static long LiveObjects();
+
+    // An automation object (CLSID_TarvoControl, ControlIds.h) that drives this
+    // runtime as the operations above do, for tools in other processes. It
+    // must be released before the runtime is destroyed.
+    CComPtr<IDispatch> ControlObject();
 
 private:
     struct Impl;

@@ -1,6 +1,7 @@
 #include "ModuleHost.h"
 
 #include "AzureLocalProcess.h"
+#include "BulkArrays.h"
 
 #include "vxhelper/messagebox.h"
 
@@ -64,7 +65,7 @@ bool PumpUntil(const std::function<bool()>& done, std::chrono::milliseconds limi
     QDeadlineTimer deadline(limit.count());
     while (!done()) {
         if (deadline.hasExpired()) return done();
-        VX_PumpMessages(5);
+        VX_PumpMessages(20);
     }
     return true;
 }
@@ -115,4 +116,37 @@ tarvo::ProjectConfig Project(const std::u16string& name, const std::vector<std::
     project.name = name;
     for (const auto& variable : numberVariables) project.variables.push_back(NumberVariable(variable, 0.0));
     return project;
+}
+
+namespace {
+
+std::u16string VariableName(int i) { return u"V" + CString::Formatted(u"%d", i).Str(); }
+
+}  // namespace
+
+CBulkPlant::CBulkPlant(int variables) {
+    tarvo::ProjectConfig plant;
+    plant.name = u"Plant";
+    for (int i = 0; i < variables; ++i) plant.variables.push_back(NumberVariable(VariableName(i), 0.0));
+    tarvo::RuntimeConfig config;
+    config.projects = {plant};
+    tarvo::RuntimeOptions options;
+    options.simulate = false;
+    runtime = std::make_unique<tarvo::Runtime>(config, options);
+    std::string error;
+    started = runtime->Start(&error);
+    for (int i = 0; started && i < variables; ++i) ids.push_back(*runtime->VariableId(u"Plant", VariableName(i)));
+}
+
+bool CBulkPlant::FireRound(double value) {
+    const std::vector<double> values(ids.size(), value), zeros(ids.size(), 0.0), times(ids.size(), 45000.25);
+    return runtime->FireRawBulkChange(u"Plant", u"", {CComVariant(static_cast<int>(ids.size())), ArrayOf(VT_R8, 0, ids),
+                                                      ArrayOf(VT_VARIANT, 0, values), ArrayOf(VT_R8, 0, zeros),
+                                                      ArrayOf(VT_R8, 0, zeros), ArrayOf(VT_R8, 0, times)});
+}
+
+std::vector<std::string> CBulkPlant::Keys() const {
+    std::vector<std::string> keys;
+    for (size_t i = 0; i < ids.size(); ++i) keys.push_back("Plant#" + CString(VariableName(static_cast<int>(i))).ToUtf8());
+    return keys;
 }

@@ -11,6 +11,7 @@
 
 #include <chrono>
 #include <functional>
+#include <memory>
 #include <mutex>
 #include <string>
 #include <vector>
@@ -77,6 +78,20 @@ private:
     int (*m_dllExit)(int) = nullptr;
 };
 
+// What a host holds: its window, a context naming the settings file, and the
+// loaded module (libSkyvane.so of this build when library is empty).
+struct CHostedModule {
+    explicit CHostedModule(const std::string& settingsPath, const std::string& library = {}) : module(library) {
+        context.m_pWnd = &host;
+        context.m_strIniFile = CString(settingsPath);
+    }
+    int Init() { return module.Init(&context); }
+
+    CRecordingHostWnd host;
+    CConfigData context;
+    CModuleUnderTest module;
+};
+
 // Runs the event loop until done() holds or the time is up; returns done().
 bool PumpUntil(const std::function<bool()>& done, std::chrono::milliseconds limit = std::chrono::seconds(20));
 
@@ -106,6 +121,21 @@ public:
 
 private:
     std::string m_path;
+};
+
+// The stand-in with one project "Plant" of number variables V0, V1, ...
+// (values change only when fired), for load.
+class CBulkPlant {
+public:
+    explicit CBulkPlant(int variables);
+    // One event in which every variable takes the value.
+    bool FireRound(double value);
+    // The variable keys, "Plant#V0" ...
+    std::vector<std::string> Keys() const;
+
+    std::unique_ptr<tarvo::Runtime> runtime;
+    std::vector<double> ids;
+    bool started = false;
 };
 
 // Stand-in configuration helpers.

@@ -3,7 +3,6 @@
 #include "ModuleHost.h"
 
 #include "AzureLocalProcess.h"
-#include "BulkArrays.h"
 
 #include <gtest/gtest.h>
 
@@ -14,43 +13,6 @@
 namespace {
 
 using azurelocal::AzureLocalProcess;
-
-std::u16string VariableName(int i) { return u"V" + CString::Formatted(u"%d", i).Str(); }
-
-class LoadedRuntime {
-public:
-    explicit LoadedRuntime(int variables) {
-        tarvo::ProjectConfig plant;
-        plant.name = u"Plant";
-        for (int i = 0; i < variables; ++i) plant.variables.push_back(NumberVariable(VariableName(i), 0.0));
-        tarvo::RuntimeConfig config;
-        config.projects = {plant};
-        tarvo::RuntimeOptions options;
-        options.simulate = false;
-        runtime = std::make_unique<tarvo::Runtime>(config, options);
-        std::string error;
-        started = runtime->Start(&error);
-        for (int i = 0; i < variables; ++i) ids.push_back(static_cast<double>(*runtime->VariableId(u"Plant", VariableName(i))));
-    }
-
-    // One event: every variable takes the value.
-    bool FireRound(double value) {
-        const std::vector<double> values(ids.size(), value), zeros(ids.size(), 0.0), times(ids.size(), 45000.25);
-        return runtime->FireRawBulkChange(u"Plant", u"", {CComVariant(static_cast<int>(ids.size())), ArrayOf(VT_R8, 0, ids),
-                                                          ArrayOf(VT_VARIANT, 0, values), ArrayOf(VT_R8, 0, zeros),
-                                                          ArrayOf(VT_R8, 0, zeros), ArrayOf(VT_R8, 0, times)});
-    }
-
-    std::vector<std::string> Keys() const {
-        std::vector<std::string> keys;
-        for (size_t i = 0; i < ids.size(); ++i) keys.push_back("Plant#" + CString(VariableName(static_cast<int>(i))).ToUtf8());
-        return keys;
-    }
-
-    std::unique_ptr<tarvo::Runtime> runtime;
-    std::vector<double> ids;
-    bool started = false;
-};
 
 // Runs the event loop until the module has posted no cycle for a second.
 void PumpUntilQuiet(const CRecordingHostWnd& host) {
@@ -73,17 +35,13 @@ TEST(ModuleLoad, EveryChangeOfTenThousandVariablesIsReceivedOrReportedDropped) {
     auto receiver = AzureLocalProcess::Start({}, error);
     ASSERT_TRUE(receiver) << error;
     constexpr int kVariables = 10000, kRounds = 10;
-    LoadedRuntime plant(kVariables);
+    CBulkPlant plant(kVariables);
     ASSERT_TRUE(plant.started);
     ModuleSettings settings{plant.Keys(), {{receiver->ConnectionString(), "values", false, 1}}};
     WriteSettingsFile(folder.Path("skyvane.ini"), settings);
-    CRecordingHostWnd host;
-    CConfigData context;
-    context.m_pWnd = &host;
-    context.m_strIniFile = CString(folder.Path("skyvane.ini"));
-    CModuleUnderTest module;
-    ASSERT_TRUE(module.Loaded());
-    ASSERT_EQ(module.Init(&context), 1);
+    CHostedModule hosted(folder.Path("skyvane.ini"));
+    ASSERT_TRUE(hosted.module.Loaded());
+    ASSERT_EQ(hosted.Init(), 1);
 
     // A change of every variable each second, for ten seconds.
     const auto start = std::chrono::steady_clock::now();
@@ -99,8 +57,8 @@ TEST(ModuleLoad, EveryChangeOfTenThousandVariablesIsReceivedOrReportedDropped) {
     producer.join();
     PumpUntil([&] { return receiver->Stats().rows >= kVariables * kRounds; }, std::chrono::seconds(30));
     const double seconds = std::chrono::duration<double>(std::chrono::steady_clock::now() - start).count();
-    PumpUntilQuiet(host);
-    module.DllExit();
+    PumpUntilQuiet(hosted.host);
+    hosted.module.DllExit();
 
     std::set<std::pair<std::string, double>> received;
     size_t duplicates = 0;
@@ -119,29 +77,25 @@ TEST(ModuleLoad, WithoutTheAzureClientTheQueueHoldsItsLimitPlusOne) {
     // The module alone in a folder: its Azure client library is not beside it.
     const std::string copy = folder.Path("libSkyvane.so");
     std::filesystem::copy_file(azurelocal::BuildBinaryDir() + "/libSkyvane.so", copy);
-    LoadedRuntime plant(10);  // queue limit 40
+    CBulkPlant plant(10);  // queue limit 40
     ASSERT_TRUE(plant.started);
     WriteSettingsFile(folder.Path("skyvane.ini"), {plant.Keys(), {{"Endpoint=sb://127.0.0.1:9/;SharedAccessKeyName=k;SharedAccessKey=s", "values", false, 1}}});
-    CRecordingHostWnd host;
-    CConfigData context;
-    context.m_pWnd = &host;
-    context.m_strIniFile = CString(folder.Path("skyvane.ini"));
     {
-        CModuleUnderTest module(copy);
-        ASSERT_TRUE(module.Loaded());
-        ASSERT_EQ(module.Init(&context), 1);
+        CHostedModule hosted(folder.Path("skyvane.ini"), copy);
+        ASSERT_TRUE(hosted.module.Loaded());
+        ASSERT_EQ(hosted.Init(), 1);
         // Rounds of ten changes, each taken over by a tick before the next,
         // so that only the module's own queue overflows: 41 kept, 9 dropped.
         for (int round = 1; round <= 5; ++round) {
             ASSERT_TRUE(plant.FireRound(round));
             VX_PumpMessages(200);
         }
-        module.DllExit();
+        hosted.module.DllExit();
+        EXPECT_EQ(hosted.host.Count(WM_USER + 2), 1);  // only the end of init: no cycle ever ran
     }
     EXPECT_EQ(log.CountContaining("Creating Azure Wrapper failed"), 1);
     EXPECT_EQ(log.CountContaining("Value change queue full: Value change for Plant#V"), 9);
     EXPECT_EQ(log.CountContaining("of project:"), 0);
-    EXPECT_EQ(host.Count(WM_USER + 2), 1);  // only the end of init: no cycle ever ran
     plant.runtime->Stop();
 }
 

@@ -13,6 +13,7 @@
 #include <cmath>
 #include <map>
 #include <set>
+#include <thread>
 
 namespace {
 
@@ -29,8 +30,6 @@ protected:
         receiver = AzureLocalProcess::Start({}, error);
         ASSERT_TRUE(receiver) << error;
         ASSERT_TRUE(module.Loaded());
-        context.m_pWnd = &host;
-        context.m_strIniFile = CString(SettingsPath());
     }
 
     void TearDown() override {
@@ -66,17 +65,19 @@ protected:
         return rows;
     }
 
+    // The receiver's count first: it is cheap, and the rows are read only once enough arrived.
     bool WaitForRows(const std::string& entity, size_t count, const std::string& variable = {}) {
-        return PumpUntil([&] { return RowsOf(entity, variable).size() >= count; });
+        return PumpUntil([&] { return receiver->Stats().rows >= count && RowsOf(entity, variable).size() >= count; });
     }
 
     TempFolder folder;
     CTestLog log{folder};
     std::unique_ptr<AzureLocalProcess> receiver;
     std::unique_ptr<tarvo::Runtime> runtime;
-    CRecordingHostWnd host;
-    CConfigData context;
-    CModuleUnderTest module;
+    CHostedModule hosted{SettingsPath()};
+    CRecordingHostWnd& host = hosted.host;
+    CConfigData& context = hosted.context;
+    CModuleUnderTest& module = hosted.module;
 };
 
 TEST_F(ModuleTest, ValuesReachEveryTargetInItsFormatOnlyWhenTheyChange) {
@@ -216,8 +217,9 @@ TEST_F(ModuleTest, DllExitEndsTheExportAndInitWorksAgain) {
     WriteSettingsFile(SettingsPath(), {{"Plant#Level"}, {Target("values", 1)}});
     ASSERT_EQ(module.Init(&context), 1);
     EXPECT_EQ(module.DllExit(), 1);
-    Set(u"Plant", u"Level", 5.0);
+    VX_PumpMessages(100);  // what the worker posted before it ended
     host.Clear();
+    Set(u"Plant", u"Level", 5.0);
     VX_PumpMessages(300);  // ticks arrive and must do nothing
     EXPECT_TRUE(host.Messages().empty());
     EXPECT_TRUE(receiver->Rows().empty());
@@ -263,9 +265,52 @@ TEST_F(ModuleTest, EveryTargetGetsTheSameRowsAndTheStatusCountsThemAll) {
     Set(u"Plant", u"C", 1.0);
     ASSERT_TRUE(WaitForRows("second", 4));
     EXPECT_EQ(RowsOf("first").size(), 4u);
-    const auto messages = host.Messages();
-    EXPECT_TRUE(std::any_of(messages.begin(), messages.end(),
-                            [](const auto& m) { return m.message == kStatus && m.wParam == 6; }));
+    // The cycle's status is posted after its last send.
+    EXPECT_TRUE(PumpUntil([&] {
+        const auto messages = host.Messages();
+        return std::any_of(messages.begin(), messages.end(), [](const auto& m) { return m.message == kStatus && m.wParam == 6; });
+    }));
+}
+
+TEST_F(ModuleTest, ExportsCalledOnAnotherThreadRunOnTheWindowsThread) {
+    StartRuntime({Project(u"Plant", {u"Level"})});
+    WriteSettingsFile(SettingsPath(), {{"Plant#Level"}, {Target("values", 1)}});
+    std::atomic<int> result{-1};
+    std::thread caller([&] { result = module.Init(&context); });
+    ASSERT_TRUE(PumpUntil([&] { return result.load() != -1; }));  // the window's thread carries it out
+    caller.join();
+    EXPECT_EQ(result.load(), 1);
+    Set(u"Plant", u"Level", 3.0);
+    ASSERT_TRUE(WaitForRows("values", 1, "Level"));
+    result = -1;
+    std::thread stopper([&] { result = module.DllExit(); });
+    ASSERT_TRUE(PumpUntil([&] { return result.load() != -1; }));
+    stopper.join();
+    EXPECT_EQ(result.load(), 1);
+}
+
+TEST_F(ModuleTest, ACheckRequestedWhileAMessageBoxIsOpenRunsWhenItCloses) {
+    StartRuntime({Project(u"Plant", {u"Level"})});
+    WriteSettingsFile(SettingsPath(), {{"Plant#Level"}, {Target("values", 1)}});
+    runtime->SetRaiseError(tarvo::ObjectKind::Variables, tarvo::dispid::CollectionItem);  // the lookup fails
+    CMessageBoxRecorder boxes;
+    // While the box is open the runtime recovers and the project becomes
+    // active again: its check is asked for inside the box's loop.
+    boxes.onShow = [&] {
+        if (boxes.Texts().size() > 1) return;
+        runtime->ClearFaults();
+        runtime->SetProjectActive(u"Plant", true);
+        VX_PumpMessages(300);
+    };
+    EXPECT_EQ(module.Init(&context), 0);
+    // The check asked for in the box runs after it: Level is subscribed again.
+    ASSERT_TRUE(PumpUntil([&] {
+        const auto containers = runtime->Containers(u"Plant");
+        return containers.size() == 1 && containers[0].started && containers[0].variables.size() == 1;
+    }));
+    Set(u"Plant", u"Level", 8.0);
+    ASSERT_TRUE(WaitForRows("values", 1, "Level"));
+    EXPECT_EQ(boxes.Texts(), std::vector<std::string>{"Variable is unknown:\nPlant#Level"});
 }
 
 }  // namespace

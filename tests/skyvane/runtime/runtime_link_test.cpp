@@ -1,9 +1,16 @@
 // The runtime link against the runtime stand-in: subscription, bulk changes,
-// the per-project queue and project switches.
+// the per-project queue and project switches. Every fixture case runs twice:
+// with the runtime in this process, and with a tarvo-runtime process reached
+// through the local-socket transport.
 #include "runtime/MultipleOnlVarsPerPrj.h"
 
+#include "automation/local_socket.h"
 #include "platform/ticks.h"
 #include "tarvo/Control.h"
+#include "tarvo/RemoteControl.h"
+
+#include "runtime_process.h"
+#include "temp_folder.h"
 
 #include "BulkArrays.h"
 
@@ -104,20 +111,176 @@ tarvo::RuntimeConfig PlantConfig() {
 // Holder cells as the bridge makes them; the link never reads through them.
 CVarItem** NewCell(std::uintptr_t tag) { return new CVarItem*(reinterpret_cast<CVarItem*>(tag)); }
 
-class RuntimeLink : public ::testing::Test {
+// What the cases drive: the runtime in this process, or one in another
+// process through its control object. Both offer the same operations.
+class RuntimeDriver {
+public:
+    virtual ~RuntimeDriver() = default;
+    virtual bool SetValue(const std::u16string& project, const std::u16string& variable, const VARIANT& value) = 0;
+    virtual bool SetValue(const std::u16string& project, const std::u16string& variable, const VARIANT& value,
+                          ULONGLONG status, DATE time) = 0;
+    virtual bool SetProjectActive(const std::u16string& project, bool active) = 0;
+    virtual bool FireRawBulkChange(const std::u16string& project, const std::u16string& container,
+                                   const std::vector<CComVariant>& args, bool byReference = true) = 0;
+    virtual void SetRefusedName(const std::u16string& variable) = 0;
+    virtual void SetStartFails(bool on) = 0;
+    virtual void SetProjectLookupFails(bool on) = 0;
+    virtual void ClearFaults() = 0;
+    virtual void SetDelivery(Delivery delivery) = 0;
+    virtual void Flush() = 0;
+    virtual std::vector<tarvo::ContainerInfo> Containers(const std::u16string& project) = 0;
+    virtual std::optional<LONG> VariableId(const std::u16string& project, const std::u16string& variable) = 0;
+    virtual size_t ProjectSinks(const std::u16string& project) = 0;
+    // Stops the runtime: every object the link holds fails from then on.
+    virtual void Stop() = 0;
+    // Checks that the link gave every runtime object back.
+    virtual void ExpectNoObjectsLeft() = 0;
+};
+
+template <typename T>
+class DriverOf : public RuntimeDriver {
+public:
+    bool SetValue(const std::u16string& p, const std::u16string& v, const VARIANT& value) override {
+        return Target().SetValue(p, v, value);
+    }
+    bool SetValue(const std::u16string& p, const std::u16string& v, const VARIANT& value, ULONGLONG status,
+                  DATE time) override {
+        return Target().SetValue(p, v, value, status, time);
+    }
+    bool SetProjectActive(const std::u16string& p, bool active) override { return Target().SetProjectActive(p, active); }
+    bool FireRawBulkChange(const std::u16string& p, const std::u16string& c, const std::vector<CComVariant>& args,
+                           bool byReference) override {
+        return Target().FireRawBulkChange(p, c, args, byReference);
+    }
+    void SetRefusedName(const std::u16string& v) override { Target().SetRefusedName(v, true); }
+    void SetStartFails(bool on) override { Target().SetStartFails(on); }
+    void SetProjectLookupFails(bool on) override { Target().SetProjectLookupFails(on); }
+    void ClearFaults() override { Target().ClearFaults(); }
+    void SetDelivery(Delivery delivery) override { Target().SetDelivery(delivery); }
+    void Flush() override { Target().Flush(); }
+    std::vector<tarvo::ContainerInfo> Containers(const std::u16string& p) override { return Target().Containers(p); }
+    std::optional<LONG> VariableId(const std::u16string& p, const std::u16string& v) override {
+        return Target().VariableId(p, v);
+    }
+    size_t ProjectSinks(const std::u16string& p) override { return Target().ProjectSinks(p); }
+
 protected:
-    void SetUp() override {
+    virtual T& Target() = 0;
+};
+
+class InProcessRuntime final : public DriverOf<tarvo::Runtime> {
+public:
+    InProcessRuntime() {
         tarvo::RuntimeOptions options;
         options.delivery = Delivery::CallerThread;
         options.simulate = false;
-        runtime = std::make_unique<tarvo::Runtime>(PlantConfig(), options);
+        m_runtime = std::make_unique<tarvo::Runtime>(PlantConfig(), options);
         std::string error;
-        ASSERT_TRUE(runtime->Start(&error)) << error;
+        started = m_runtime->Start(&error);
+        EXPECT_TRUE(started) << error;
+    }
+    void Stop() override { m_runtime->Stop(); }
+    void ExpectNoObjectsLeft() override {
+        m_runtime.reset();
+        EXPECT_EQ(tarvo::Runtime::LiveObjects(), 0) << "automation objects leaked";
+    }
+    bool started = false;
+
+protected:
+    tarvo::Runtime& Target() override { return *m_runtime; }
+
+private:
+    std::unique_ptr<tarvo::Runtime> m_runtime;
+};
+
+// PlantConfig as a project file.
+constexpr const char* kPlantJson = R"({"projects": [
+  {"name": "Plant", "variables": [
+    {"name": "Level", "value": 1}, {"name": "Temp", "value": 1}, {"name": "Tank#Level", "value": 1},
+    {"name": "Flow", "value": 1}, {"name": "Pressure", "value": 1}, {"name": "Speed", "value": 1},
+    {"name": "Mode", "type": "text", "value": "auto"}]},
+  {"name": "Line2", "variables": [{"name": "Speed", "value": 2}, {"name": "Torque", "value": 3}]}]})";
+
+// A tarvo-runtime process on a socket folder of its own, found by the link
+// through the local-socket source while this object lives.
+class SocketRuntime final : public DriverOf<tarvo::RemoteControl> {
+public:
+    SocketRuntime() {
+        LocalSocketOptions options;
+        options.folder = m_folder.Path("sockets");
+        m_source = AddRunningObjectSource(CreateLocalSocketSource(options));
+        started = Launch();
+    }
+    ~SocketRuntime() override {
+        m_control.reset();
+        m_process.Stop();
+        RemoveRunningObjectSource(m_source);
+        EXPECT_EQ(LocalSocketProxyCount(), 0) << "proxies leaked";
+    }
+    // Starts a (new) runtime process, paused, delivering on the calling thread.
+    bool Launch() {
+        m_control.reset();
+        const std::string project = m_folder.Write("plant.json", kPlantJson);
+        if (!m_process.Start(project, m_folder.Path("sockets"), {"--paused"})) {
+            ADD_FAILURE() << "tarvo-runtime did not start: " << m_process.Output();
+            return false;
+        }
+        m_control = std::make_unique<tarvo::RemoteControl>(tarvo::RemoteControl::Find());
+        if (m_control->SetDelivery(Delivery::CallerThread)) return true;
+        ADD_FAILURE() << "no control object: status " << std::hex << m_control->LastStatus() << "; " << m_process.Output();
+        return false;
+    }
+    void Kill() {
+        m_control.reset();
+        m_process.Kill(SIGKILL);
+    }
+    void Stop() override {
+        m_control.reset();
+        EXPECT_TRUE(m_process.Stop()) << m_process.Output();
+    }
+    void ExpectNoObjectsLeft() override {
+        if (!m_control) return;
+        // A call on the application's connection comes after the link's releases
+        // there; then only the application object itself is left.
+        CComPtr<IUnknown> application;
+        ASSERT_EQ(GetActiveObject(CLSID_TarvoApplication, application.Receive()), S_OK);
+        application.Release();
+        ASSERT_EQ(GetActiveObject(CLSID_TarvoApplication, application.Receive()), S_OK);
+        application.Release();
+        EXPECT_EQ(m_control->LiveObjects(), 1) << "automation objects leaked";
+    }
+    tarvo::RemoteControl& Control() { return *m_control; }
+    bool started = false;
+
+protected:
+    tarvo::RemoteControl& Target() override { return *m_control; }
+
+private:
+    TempFolder m_folder;
+    RuntimeProcess m_process;
+    DWORD m_source = 0;
+    std::unique_ptr<tarvo::RemoteControl> m_control;
+};
+
+enum class Transport { InProcess, LocalSocket };
+
+class RuntimeLink : public ::testing::TestWithParam<Transport> {
+protected:
+    void SetUp() override {
+        if (GetParam() == Transport::InProcess) {
+            auto local = std::make_unique<InProcessRuntime>();
+            ASSERT_TRUE(local->started);
+            runtime = std::move(local);
+        } else {
+            auto remote = std::make_unique<SocketRuntime>();
+            ASSERT_TRUE(remote->started);
+            runtime = std::move(remote);
+        }
     }
     void TearDown() override {
         manager.Reset();
+        if (runtime) runtime->ExpectNoObjectsLeft();
         runtime.reset();
-        EXPECT_EQ(tarvo::Runtime::LiveObjects(), 0) << "automation objects leaked";
     }
 
     void MakeManager(DWORD timeoutMs = 2000) { manager = VX_CreateCounted<CMultipleOnlVarsPerPrj>(&target, CString(), timeoutMs); }
@@ -155,11 +318,14 @@ protected:
     }
 
     RecordingTarget target;
-    std::unique_ptr<tarvo::Runtime> runtime;
+    std::unique_ptr<RuntimeDriver> runtime;
     VX_KeepRefCmdPtr<CMultipleOnlVarsPerPrj> manager;
 };
 
 }  // namespace
+
+INSTANTIATE_TEST_SUITE_P(Transports, RuntimeLink, ::testing::Values(Transport::InProcess, Transport::LocalSocket),
+                         [](const auto& info) { return info.param == Transport::InProcess ? "InProcess" : "LocalSocket"; });
 
 TEST(VariableKey, SplitsAtTheFirstHash) {
     CString project, variable;
@@ -174,7 +340,7 @@ TEST(VariableKey, SplitsAtTheFirstHash) {
     EXPECT_EQ(variable, CString(u"Level"));
 }
 
-TEST_F(RuntimeLink, SubscribesPerProjectAndRefusesUnknownOrRepeatedNames) {
+TEST_P(RuntimeLink, SubscribesPerProjectAndRefusesUnknownOrRepeatedNames) {
     MakeManager();
     EXPECT_EQ(Subscribe({u"Plant#Level", u"Plant#Tank#Level", u"Line2#Speed"}), 3);
     EXPECT_EQ(manager->Projects().size(), 2u);
@@ -187,7 +353,7 @@ TEST_F(RuntimeLink, SubscribesPerProjectAndRefusesUnknownOrRepeatedNames) {
     EXPECT_EQ(Subscribe({u"Line3#X"}), 0);
 }
 
-TEST_F(RuntimeLink, StartSubscribesNamesInOrderAndSetsTheLimitOnce) {
+TEST_P(RuntimeLink, StartSubscribesNamesInOrderAndSetsTheLimitOnce) {
     MakeManager();
     EXPECT_TRUE(manager->Start());  // nothing to start
     ASSERT_EQ(Subscribe({u"Plant#Level", u"Plant#Tank#Level", u"Plant#Flow"}), 3);
@@ -204,7 +370,7 @@ TEST_F(RuntimeLink, StartSubscribesNamesInOrderAndSetsTheLimitOnce) {
     EXPECT_EQ(Project(u"Plant")->GetQueueLimit(), 12);  // kept from the first start
 }
 
-TEST_F(RuntimeLink, ContainerNamesDifferPerProjectObject) {
+TEST_P(RuntimeLink, ContainerNamesDifferPerProjectObject) {
     MakeManager();
     Subscribe({u"Plant#Level", u"Line2#Speed"});
     EXPECT_NE(Project(u"Plant")->GetContainerName(), Project(u"Line2")->GetContainerName());
@@ -212,7 +378,7 @@ TEST_F(RuntimeLink, ContainerNamesDifferPerProjectObject) {
     EXPECT_NE(plant.Left(plant.Find(u'_')), line.Left(line.Find(u'_')));  // the object's address
 }
 
-TEST_F(RuntimeLink, OneFailingProjectDropsEveryProject) {
+TEST_P(RuntimeLink, OneFailingProjectDropsEveryProject) {
     MakeManager();
     ASSERT_EQ(Subscribe({u"Line2#Speed", u"Plant#Level", u"Plant#Flow"}), 3);
     runtime->SetRefusedName(u"Level");  // Plant's container refuses it
@@ -228,7 +394,7 @@ TEST_F(RuntimeLink, OneFailingProjectDropsEveryProject) {
     EXPECT_TRUE(manager->Projects().empty());
 }
 
-TEST_F(RuntimeLink, BulkChangeQueuesSubscribedElementsInOrder) {
+TEST_P(RuntimeLink, BulkChangeQueuesSubscribedElementsInOrder) {
     MakeManager();
     ASSERT_EQ(Subscribe({u"Plant#Level", u"Plant#Flow"}), 2);
     ASSERT_TRUE(manager->Start());
@@ -250,7 +416,7 @@ TEST_F(RuntimeLink, BulkChangeQueuesSubscribedElementsInOrder) {
     EXPECT_EQ(Project(u"Plant")->GetQueuedCount(), 0);
 }
 
-TEST_F(RuntimeLink, ValuesFromTheRuntimeArriveWithTheirHolderCell) {
+TEST_P(RuntimeLink, ValuesFromTheRuntimeArriveWithTheirHolderCell) {
     MakeManager();
     CVarItem** cell = NewCell(0xC0FFEE);
     ASSERT_TRUE(manager->AddVariable(u"Plant#Mode", cell));
@@ -264,7 +430,7 @@ TEST_F(RuntimeLink, ValuesFromTheRuntimeArriveWithTheirHolderCell) {
     EXPECT_EQ(target.changes[0].cell, cell);
 }
 
-TEST_F(RuntimeLink, QueueLimitTakesOneMoreThenRefuses) {
+TEST_P(RuntimeLink, QueueLimitTakesOneMoreThenRefuses) {
     MakeManager();
     ASSERT_EQ(Subscribe({u"Plant#Level", u"Plant#Temp", u"Plant#Flow", u"Plant#Pressure", u"Plant#Speed"}), 5);
     ASSERT_TRUE(manager->Start());
@@ -293,7 +459,7 @@ TEST(PerProjectQueue, LimitZeroHasNoBoundAndNullValuesArriveEmpty) {
     EXPECT_EQ(target.changes.back().id, 0u);
 }
 
-TEST_F(RuntimeLink, DeactivationDiscardsAndStopsThenActivationResubscribes) {
+TEST_P(RuntimeLink, DeactivationDiscardsAndStopsThenActivationResubscribes) {
     runtime->SetDelivery(Delivery::OwnThread);
     MakeManager();
     ASSERT_EQ(Subscribe({u"Plant#Level", u"Plant#Tank#Level", u"Plant#Flow"}), 3);
@@ -326,7 +492,7 @@ TEST_F(RuntimeLink, DeactivationDiscardsAndStopsThenActivationResubscribes) {
     EXPECT_EQ(after[0].variables, before[0].variables);
 }
 
-TEST_F(RuntimeLink, ActiveOnAnotherThreadWaitsForThePendingInactive) {
+TEST_P(RuntimeLink, ActiveOnAnotherThreadWaitsForThePendingInactive) {
     MakeManager();
     ASSERT_EQ(Subscribe({u"Plant#Level"}), 1);
     ASSERT_TRUE(manager->Start());
@@ -352,7 +518,7 @@ TEST_F(RuntimeLink, ActiveOnAnotherThreadWaitsForThePendingInactive) {
     EXPECT_TRUE(target.activeFailed.empty());
 }
 
-TEST_F(RuntimeLink, InactiveOnTheTimerThreadFailsAtTheDeadline) {
+TEST_P(RuntimeLink, InactiveOnTheTimerThreadFailsAtTheDeadline) {
     MakeManager(200);  // caller-thread delivery: the event arrives on the "timer" thread
     ASSERT_EQ(Subscribe({u"Plant#Level"}), 1);
     ASSERT_TRUE(manager->Start());
@@ -364,7 +530,7 @@ TEST_F(RuntimeLink, InactiveOnTheTimerThreadFailsAtTheDeadline) {
     EXPECT_EQ(target.deactivated.size(), 1u);
 }
 
-TEST_F(RuntimeLink, MalformedBulkArraysAreReadSafely) {
+TEST_P(RuntimeLink, MalformedBulkArraysAreReadSafely) {
     MakeManager();
     ASSERT_EQ(Subscribe({u"Plant#Level", u"Plant#Flow"}), 2);
     ASSERT_TRUE(manager->Start());
@@ -405,7 +571,7 @@ TEST_F(RuntimeLink, MalformedBulkArraysAreReadSafely) {
     EXPECT_EQ(target.changes[3].number, 9.0);
 }
 
-TEST_F(RuntimeLink, RuntimeThreadFiresWhileTheTimerDrains) {
+TEST_P(RuntimeLink, RuntimeThreadFiresWhileTheTimerDrains) {
     runtime->SetDelivery(Delivery::OwnThread);
     MakeManager();
     ASSERT_EQ(Subscribe({u"Plant#Level", u"Plant#Flow"}), 2);
@@ -437,7 +603,7 @@ TEST_F(RuntimeLink, RuntimeThreadFiresWhileTheTimerDrains) {
     }
 }
 
-TEST_F(RuntimeLink, StoppedRuntimeLeavesNothingBehind) {
+TEST_P(RuntimeLink, StoppedRuntimeLeavesNothingBehind) {
     MakeManager();
     ASSERT_EQ(Subscribe({u"Plant#Level", u"Line2#Speed"}), 2);
     ASSERT_TRUE(manager->Start());
@@ -448,7 +614,7 @@ TEST_F(RuntimeLink, StoppedRuntimeLeavesNothingBehind) {
     manager.Reset();  // tear-down against a dead runtime: no crash, and no leak (checked in TearDown)
 }
 
-TEST_F(RuntimeLink, ReleasingVariablesDropsChangesThatReferToTheirCells) {
+TEST_P(RuntimeLink, ReleasingVariablesDropsChangesThatReferToTheirCells) {
     MakeManager();
     ASSERT_EQ(Subscribe({u"Plant#Level", u"Line2#Speed"}), 2);
     ASSERT_TRUE(manager->Start());
@@ -461,7 +627,7 @@ TEST_F(RuntimeLink, ReleasingVariablesDropsChangesThatReferToTheirCells) {
     EXPECT_FALSE(runtime->Containers(u"Line2").at(0).started);
 }
 
-TEST_F(RuntimeLink, ValuesPassedByReferenceAreQueuedAsValues) {
+TEST_P(RuntimeLink, ValuesPassedByReferenceAreQueuedAsValues) {
     MakeManager();
     ASSERT_EQ(Subscribe({u"Plant#Level"}), 1);
     ASSERT_TRUE(manager->Start());
@@ -514,4 +680,94 @@ TEST(ProjectWatcher, FollowsARestartedRuntimeAfterAFailedUnadvise) {
     EXPECT_EQ(target.inactive, 1);
     watcher.Reset();
     EXPECT_EQ(second.ProjectSinks(u"Plant"), 0u);
+}
+
+TEST(ProjectWatcher, FollowsARuntimeProcessKilledAndStartedAgain) {
+    CountingProjectTarget target;
+    auto watcher = VX_CreateCounted<COnlProject>(&target);
+    SocketRuntime runtime;
+    ASSERT_TRUE(runtime.started);
+    ASSERT_TRUE(watcher->Attach(u"Plant"));
+    runtime.Kill();
+    ASSERT_TRUE(runtime.Launch());
+    ASSERT_TRUE(watcher->Attach(u"Plant"));  // a fresh connection, a fresh advise
+    EXPECT_EQ(runtime.Control().ProjectSinks(u"Plant"), 1u);
+    runtime.Control().SetProjectActive(u"Plant", false);  // delivered before the call returns
+    EXPECT_EQ(target.inactive, 1);
+    watcher.Reset();
+    EXPECT_EQ(runtime.Control().ProjectSinks(u"Plant"), 0u);
+}
+
+namespace {
+
+// A plant whose 400 variables all change every 10 ms.
+std::string LoadProjectJson() {
+    return R"({"tick_ms": 10, "projects": [{"name": "Load", "variables": [
+      {"name": "V{n}", "repeat": 400, "generator": {"kind": "counter", "period_ms": 10}}]}]})";
+}
+
+// Runs the module's timer (ProcessPending) until at least n more changes
+// arrived or 10 s passed; true when they did.
+bool ChangesFlow(CMultipleOnlVarsPerPrj* manager, RecordingTarget& target, size_t n) {
+    const size_t goal = target.ChangeCount() + n;
+    const ULONGLONG end = GetTickCount64() + 10000;
+    while (target.ChangeCount() < goal && GetTickCount64() < end) {
+        manager->ProcessPending();
+        Sleep(10);  // the timer's period
+    }
+    return target.ChangeCount() >= goal;
+}
+
+int SubscribeLoad(CMultipleOnlVarsPerPrj* manager) {
+    int accepted = 0;
+    for (int i = 1; i <= 400; ++i) {
+        CVarItem** cell = NewCell(static_cast<std::uintptr_t>(i));
+        if (manager->AddVariable(CString(u"Load#V") + CString(std::to_string(i)), cell)) ++accepted;
+        else delete cell;
+    }
+    return accepted;
+}
+
+}  // namespace
+
+// The runtime process killed while its changes stream in: the link's calls
+// fail at once (not at the 30 s call time-out), nothing hangs or crashes, and
+// a new runtime process is attached to again.
+TEST(RuntimeProcess, KilledUnderLoadThenFoundAgain) {
+    TempFolder folder;
+    LocalSocketOptions options;
+    options.folder = folder.Path("sockets");
+    const DWORD source = AddRunningObjectSource(CreateLocalSocketSource(options));
+    const std::string project = folder.Write("load.json", LoadProjectJson());
+    RecordingTarget target;
+    {
+        RuntimeProcess first;
+        ASSERT_TRUE(first.Start(project, options.folder)) << first.Output();
+        auto manager = VX_CreateCounted<CMultipleOnlVarsPerPrj>(&target, CString(), 2000);
+        ASSERT_EQ(SubscribeLoad(manager.Get()), 400);
+        ASSERT_TRUE(manager->Start());
+        ASSERT_TRUE(ChangesFlow(manager.Get(), target, 4000));
+
+        first.Kill(SIGKILL);
+        const ULONGLONG start = GetTickCount64();
+        manager->ProcessPending();
+        manager->ReleaseVariables();
+        CVarItem** cell = NewCell(1);
+        EXPECT_FALSE(manager->AddVariable(u"Load#V1", cell));  // no runtime to attach to
+        delete cell;
+        manager.Reset();
+        EXPECT_LT(GetTickCount64() - start, 5000u) << "calls waited instead of failing";
+    }
+    {
+        RuntimeProcess second;
+        ASSERT_TRUE(second.Start(project, options.folder)) << second.Output();
+        auto manager = VX_CreateCounted<CMultipleOnlVarsPerPrj>(&target, CString(), 2000);
+        ASSERT_EQ(SubscribeLoad(manager.Get()), 400);
+        ASSERT_TRUE(manager->Start());
+        EXPECT_TRUE(ChangesFlow(manager.Get(), target, 4000));
+        manager.Reset();
+        EXPECT_TRUE(second.Stop()) << second.Output();
+    }
+    RemoveRunningObjectSource(source);
+    EXPECT_EQ(LocalSocketProxyCount(), 0);
 }

@@ -1,13 +1,23 @@
 #include "AzureLocalProcess.h"
 
 #include <QCoreApplication>
-#include <QDir>
 
 #include <curl/curl.h>
 #include <openssl/pem.h>
 #include <openssl/x509v3.h>
 
+#include <cerrno>
+#include <chrono>
+#include <csignal>
 #include <cstdio>
+#include <cstdlib>
+#include <cstring>
+
+#include <fcntl.h>
+#include <poll.h>
+#include <sys/syscall.h>
+#include <sys/wait.h>
+#include <unistd.h>
 
 namespace azurelocal {
 
@@ -27,41 +37,100 @@ std::uint64_t Number(const JsonValue& object, const char* name) {
 
 std::string BuildBinaryDir() { return QCoreApplication::applicationDirPath().toStdString(); }
 
+// The child is started with a plain fork and exec rather than QProcess: Qt
+// starts children with a clone that shares the parent's memory, and
+// ThreadSanitizer's bookkeeping in such a child corrupts the parent's, so that
+// later locking in the test process went unseen.
+bool AzureLocalProcess::Spawn(const std::vector<std::string>& arguments, std::string& error) {
+    std::vector<char*> argv;
+    for (const std::string& a : arguments) argv.push_back(const_cast<char*>(a.c_str()));
+    argv.push_back(nullptr);
+    int toChild[2], fromChild[2];
+    if (pipe2(toChild, O_CLOEXEC) != 0) {
+        error = std::string("pipe: ") + std::strerror(errno);
+        return false;
+    }
+    if (pipe2(fromChild, O_CLOEXEC) != 0) {
+        error = std::string("pipe: ") + std::strerror(errno);
+        close(toChild[0]);
+        close(toChild[1]);
+        return false;
+    }
+    m_pid = fork();
+    if (m_pid == 0) {  // only async-signal-safe calls from here on
+        dup2(toChild[0], STDIN_FILENO);
+        dup2(fromChild[1], STDOUT_FILENO);
+        execv(argv[0], argv.data());
+        _exit(127);
+    }
+    close(toChild[0]);
+    close(fromChild[1]);
+    m_stdin = toChild[1];
+    m_stdout = fromChild[0];
+    if (m_pid < 0) {
+        error = std::string("fork: ") + std::strerror(errno);
+        return false;
+    }
+    return true;
+}
+
+// The first line the child prints, within the time limit.
+bool AzureLocalProcess::ReadFirstLine(std::string& line, int timeoutMs) {
+    const auto deadline = std::chrono::steady_clock::now() + std::chrono::milliseconds(timeoutMs);
+    while (line.find('\n') == std::string::npos) {
+        const auto left = std::chrono::duration_cast<std::chrono::milliseconds>(deadline - std::chrono::steady_clock::now());
+        pollfd wait{m_stdout, POLLIN, 0};
+        if (left.count() <= 0 || poll(&wait, 1, static_cast<int>(left.count())) <= 0) return false;
+        char buffer[256];
+        const ssize_t n = read(m_stdout, buffer, sizeof buffer);
+        if (n <= 0) return false;
+        line.append(buffer, static_cast<size_t>(n));
+    }
+    line.resize(line.find('\n'));
+    return true;
+}
+
 std::unique_ptr<AzureLocalProcess> AzureLocalProcess::Start(const QStringList& arguments, std::string& error) {
     std::unique_ptr<AzureLocalProcess> server(new AzureLocalProcess());
-    const QString program = QDir(QCoreApplication::applicationDirPath()).filePath("azure-local");
-    server->m_process.setProcessChannelMode(QProcess::ForwardedErrorChannel);
-    server->m_process.start(program, QStringList{"--port", "0", "--quit-on-eof"} + arguments);
-    if (!server->m_process.waitForStarted(10000)) {
-        error = "azure-local did not start: " + server->m_process.errorString().toStdString();
+    std::vector<std::string> argv{BuildBinaryDir() + "/azure-local", "--port", "0", "--quit-on-eof"};
+    for (const QString& a : arguments) argv.push_back(a.toStdString());
+    if (!server->Spawn(argv, error)) {
+        error = "azure-local did not start: " + error;
         return nullptr;
     }
-    QByteArray line;
-    while (!line.contains('\n')) {
-        if (!server->m_process.waitForReadyRead(10000)) {
-            error = "azure-local did not report its port";
-            return nullptr;
-        }
-        line += server->m_process.readAllStandardOutput();
-    }
-    line = line.left(line.indexOf('\n')).trimmed();
-    if (!line.startsWith("PORT ")) {
-        error = "azure-local printed '" + line.toStdString() + "' instead of its port";
+    std::string line;
+    if (!server->ReadFirstLine(line, 10000)) {
+        error = "azure-local did not report its port";
         return nullptr;
     }
-    server->m_port = line.mid(5).toInt();
+    if (line.rfind("PORT ", 0) != 0) {
+        error = "azure-local printed '" + line + "' instead of its port";
+        return nullptr;
+    }
+    server->m_port = std::atoi(line.c_str() + 5);
     const qsizetype cert = arguments.indexOf("--tls-cert");
     if (cert >= 0 && cert + 1 < arguments.size()) server->m_tlsCertificate = arguments[cert + 1].toStdString();
     return server;
 }
 
-AzureLocalProcess::~AzureLocalProcess() {
-    if (m_process.state() == QProcess::NotRunning) return;
-    m_process.closeWriteChannel();  // --quit-on-eof ends it
-    if (!m_process.waitForFinished(3000)) {
-        m_process.kill();
-        m_process.waitForFinished(3000);
+// Waits up to timeoutMs for the child to end; true once it is reaped.
+bool AzureLocalProcess::WaitForExit(int timeoutMs) {
+    const int pidfd = static_cast<int>(syscall(SYS_pidfd_open, m_pid, 0));
+    if (pidfd >= 0) {
+        pollfd wait{pidfd, POLLIN, 0};
+        poll(&wait, 1, timeoutMs);
+        close(pidfd);
     }
+    return waitpid(m_pid, nullptr, WNOHANG) == m_pid;
+}
+
+AzureLocalProcess::~AzureLocalProcess() {
+    if (m_stdin >= 0) close(m_stdin);  // --quit-on-eof ends it
+    if (m_pid > 0 && !WaitForExit(3000)) {
+        kill(m_pid, SIGKILL);
+        waitpid(m_pid, nullptr, 0);
+    }
+    if (m_stdout >= 0) close(m_stdout);
 }
 
 std::string AzureLocalProcess::ConnectionString(const std::string& extra) const {

@@ -2,8 +2,9 @@
 // Runs azure-local as a child process on a free loopback port and drives it
 // through its control endpoints. For tests and benchmarks.
 
-#include <QProcess>
 #include <QStringList>
+
+#include <sys/types.h>
 
 #include <cstdint>
 #include <memory>
@@ -49,7 +50,13 @@ private:
     AzureLocalProcess() = default;
     bool Control(const std::string& method, const std::string& path, std::string* body = nullptr);
 
-    QProcess m_process;
+    bool Spawn(const std::vector<std::string>& arguments, std::string& error);
+    bool ReadFirstLine(std::string& line, int timeoutMs);
+    bool WaitForExit(int timeoutMs);
+
+    pid_t m_pid = -1;
+    int m_stdin = -1;   // closing it ends the child
+    int m_stdout = -1;  // the child's standard output, read for its port
     int m_port = 0;
     std::string m_tlsCertificate;  // the server's certificate when it serves HTTPS
 };
