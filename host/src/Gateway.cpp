@@ -1,6 +1,7 @@
 #include "Gateway.h"
 
 #include "automation/comptr.h"
+#include "automation/local_socket.h"
 #include "automation/rot.h"
 #include "tarvo/Control.h"
 #include "tarvo/TarvoIds.h"
@@ -100,6 +101,18 @@ CGateway::CGateway(const GatewayOptions& options, CSkyvaneModule& module, tarvo:
 CGateway::~CGateway() {
     StopModule();
     if (m_pRuntime) m_pRuntime->Stop();
+    DetachRuntimeSource();
+}
+
+void CGateway::AttachRuntimeSource() {
+    LocalSocketOptions options;  // the folder: $SKYVANE_AUTOMATION_DIR, else the user's runtime folder
+    options.log = [](const std::string& text) { GatewayError("runtime connection: " + text); };
+    m_dwRuntimeSource = AddRunningObjectSource(CreateLocalSocketSource(options));
+}
+
+void CGateway::DetachRuntimeSource() {
+    if (m_dwRuntimeSource) RemoveRunningObjectSource(m_dwRuntimeSource);
+    m_dwRuntimeSource = 0;
 }
 
 bool CGateway::Start() {
@@ -107,7 +120,9 @@ bool CGateway::Start() {
     m_statusTimer.start(Milliseconds(m_options.statusInterval));
     m_intervalClock.start();
     if (m_options.duration > 0) m_durationTimer.start(Milliseconds(m_options.duration));
-    if (!m_options.projectFile.empty()) {
+    if (m_options.projectFile.empty()) {
+        AttachRuntimeSource();
+    } else {
         if (m_options.simulateDelay > 0) {
             GatewaySay("the runtime stand-in starts in " + std::to_string(Milliseconds(m_options.simulateDelay)) + " ms");
             m_runtimeTimer.start(Milliseconds(m_options.simulateDelay));
@@ -241,14 +256,16 @@ void CGateway::Stop(const char* reason, int exitCode) {
     QCoreApplication::sendPostedEvents();
     PrintStatus();
     WriteMetrics();
-    m_module.Unload();
+    m_module.Unload();  // releases what the module held of the runtime
     if (m_pRuntime) m_pRuntime->Stop();
+    DetachRuntimeSource();
     GatewaySay("stopped");
     QCoreApplication::exit(exitCode);
 }
 
 int CGateway::Configure() {
-    if (!m_options.projectFile.empty() && !StartRuntime()) return 2;
+    if (m_options.projectFile.empty()) AttachRuntimeSource();
+    else if (!StartRuntime()) return 2;
     // The module takes the host's context in init; konfig before init does nothing.
     m_bInInit = true;
     const int started = m_module.Init(&m_context);
@@ -260,6 +277,7 @@ int CGateway::Configure() {
     QCoreApplication::sendPostedEvents();
     m_module.Unload();
     if (m_pRuntime) m_pRuntime->Stop();
+    DetachRuntimeSource();
     return 0;
 }
 

@@ -59,6 +59,9 @@ public:
 
 private:
     bool StartRuntime();
+    // Without --simulate: lets the running-object table reach a runtime in another process.
+    void AttachRuntimeSource();
+    void DetachRuntimeSource();
     void AttemptStart();
     void ScheduleAttempt(const std::string& why);
     void StopModule();
@@ -88,6 +91,7 @@ private:
     bool m_bRestartFailed = false;   // a 1126 arrived since the last exec_action
     bool m_bMetricsFailing = false;  // the last metrics write failed (reported once)
     unsigned m_nAttempt = 0;
+    DWORD m_dwRuntimeSource = 0;     // the local-socket source of the running-object table, 0 when none
 };
 
 // A line on standard output, with the local time in front.

@@ -157,7 +157,9 @@ OPTIONS
         It must exist and be readable.
     --simulate PROJECT.json
         Start the SCADA runtime stand-in in this process with that project
-        file, instead of attaching to the runtime that is running.
+        file, instead of attaching to the runtime that is running. Without
+        it, the gateway reaches a runtime of the same user in another
+        process through its local socket (see SKYVANE_AUTOMATION_DIR).
     --simulate-delay S
         Start the stand-in only S seconds after the gateway, as a runtime
         that comes up after the service does.
@@ -196,7 +198,10 @@ EXIT STATUS
        cannot be read, or configure without a display
 
 ENVIRONMENT
-    BRENNIC_CONFIG  the central log's configuration file
+    BRENNIC_CONFIG          the central log's configuration file
+    SKYVANE_AUTOMATION_DIR  the folder of the runtime's sockets (default:
+                            $XDG_RUNTIME_DIR/skyvane-automation, else
+                            /tmp/skyvane-automation-UID)
 
 EXAMPLES
     skyvane-gateway run --ini /etc/skyvane/skyvane.ini --metrics-file \

@@ -27,7 +27,13 @@ public:
                             const std::string& workingDirectory = {}) {
         QStringList list;
         for (const std::string& argument : arguments) list << QString::fromStdString(argument);
-        m_process.setProcessEnvironment(environment);
+        // The gateway looks for a runtime of another process in the socket folder: a test
+        // must not find one that someone else runs on this machine.
+        QProcessEnvironment isolated = environment;
+        if (!isolated.contains("SKYVANE_AUTOMATION_DIR"))
+            isolated.insert("SKYVANE_AUTOMATION_DIR", QDir::temp().filePath(QString("skyvane-gateway-test-%1-no-runtime")
+                                                                                .arg(QCoreApplication::applicationPid())));
+        m_process.setProcessEnvironment(isolated);
         if (!workingDirectory.empty()) m_process.setWorkingDirectory(QString::fromStdString(workingDirectory));
         m_process.start(QString::fromStdString(BinDir() + "/skyvane-gateway"), list);
         m_process.waitForStarted(10000);

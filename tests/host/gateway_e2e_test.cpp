@@ -2,6 +2,7 @@
 // --simulate and azure-local: the whole road from a simulated plant to Azure.
 #include "AzureLocalProcess.h"
 #include "GatewayProcess.h"
+#include "runtime_process.h"
 #include "temp_folder.h"
 
 #include <QElapsedTimer>
@@ -157,6 +158,24 @@ TEST_F(GatewayEndToEnd, StartedBeforeTheRuntimeItKeepsTryingAndThenSends) {
               "");
     ASSERT_NE(gateway->WaitForLine(IsStatusWithRows), "");
     EXPECT_GE(StopWith(*gateway, SIGTERM), 0);
+    EXPECT_GT(RowsPerEntity()["values"], 0u);
+}
+
+TEST_F(GatewayEndToEnd, AttachesToARuntimeInAnotherProcessThatStartsLater) {
+    const std::string sockets = m_folder.Path("sockets");
+    m_environment.insert("SKYVANE_AUTOMATION_DIR", QString::fromStdString(sockets));
+    GatewayProcess gateway({"run", "--ini", WriteSettings({{"values", false, 1}}), "--status-interval", "0.5"},
+                           m_environment);
+    ASSERT_NE(gateway.WaitForText("start attempt 1 failed: no SCADA runtime is reachable"), "") << gateway.Errors();
+    RuntimeProcess runtime;
+    ASSERT_TRUE(runtime.Start(Project(), sockets));
+    EXPECT_NE(gateway.WaitForLine([](const std::string& line) {
+                  return line.find("start attempt") != std::string::npos && line.find("the module runs") != std::string::npos;
+              }),
+              "");
+    ASSERT_NE(gateway.WaitForLine(IsStatusWithRows), "");
+    EXPECT_GE(StopWith(gateway, SIGTERM), 0);
+    EXPECT_TRUE(runtime.Stop());
     EXPECT_GT(RowsPerEntity()["values"], 0u);
 }
 
