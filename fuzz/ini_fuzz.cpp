@@ -1,6 +1,8 @@
 // libFuzzer target for the INI reader: any bytes must parse without a fault,
 // serialise back unchanged, answer lookups consistently, and take a write
-// that reads back, also through the profile functions on a real file.
+// that reads back, also through the profile functions on a real file. A
+// Windows-1252 file that takes a character beyond its code page must turn
+// into UTF-16LE and keep every value.
 
 #include "vxhelper/IniDocument.h"
 #include "vxhelper/profile.h"
@@ -8,8 +10,11 @@
 #include <cstdint>
 #include <cstdio>
 #include <cstdlib>
+#include <optional>
 #include <string>
+#include <tuple>
 #include <unistd.h>
+#include <vector>
 
 namespace {
 
@@ -53,6 +58,26 @@ void CheckDocument(std::string_view bytes) {
     Check(again.GetValue(u"new section", u"K") == u"'x'", "a new section must survive serialising");
 }
 
+void CheckReencoding(std::string_view bytes) {
+    VX_CIniDocument doc = VX_CIniDocument::Parse(bytes);
+    const bool ansi = doc.GetEncoding() == VX_CIniDocument::Encoding::Windows1252;
+    std::vector<std::tuple<const char16_t*, std::u16string, std::optional<std::u16string>>> values;
+    for (const char16_t* section : {u"Azure", u"VARIABLES", u"CONNECTIONS", u"s"}) {
+        for (const std::u16string& key : doc.GetKeyNames(section))
+            values.emplace_back(section, key, doc.GetValue(section, key));
+    }
+    const std::u16string wide = u"Linie#\u6e29\u5ea6 \u20ac";
+    Check(doc.SetValue(u"VARIABLES", u"NAME_\u4e2d", wide), "a valid write must be accepted");
+    if (ansi) {
+        Check(doc.GetEncoding() == VX_CIniDocument::Encoding::Utf16Le,
+              "a character beyond the code page must give UTF-16LE");
+    }
+    const VX_CIniDocument again = VX_CIniDocument::Parse(doc.Serialize());
+    Check(again.GetValue(u"variables", u"name_\u4e2d") == wide, "a write beyond the code page must read back");
+    for (const auto& [section, key, value] : values)
+        Check(again.GetValue(section, key) == value, "a change of encoding must keep every value");
+}
+
 void CheckProfileFunctions(std::string_view bytes) {
     const std::string& path = ScratchFile();
     if (FILE* file = std::fopen(path.c_str(), "wb")) {
@@ -76,6 +101,7 @@ void CheckProfileFunctions(std::string_view bytes) {
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
     const std::string_view bytes(reinterpret_cast<const char*>(data), size);
     CheckDocument(bytes);
+    CheckReencoding(bytes);
     CheckProfileFunctions(bytes);
     return 0;
 }

@@ -33,16 +33,6 @@ std::string SignatureOf(const std::string& token) {
     return token.substr(start + 4, end == std::string::npos ? std::string::npos : end - start - 4);
 }
 
-std::string Describe(const HttpResponse& response) {
-    if (response.status == 0) {
-        return (response.tlsFailure ? "TLS failure: " : "transport error: ") + response.transportError;
-    }
-    std::string text = "HTTP " + std::to_string(response.status);
-    const std::string detail = ServiceErrorText(response);
-    if (!detail.empty()) text += " (" + detail + ")";
-    return text;
-}
-
 }  // namespace
 
 struct AzureClient::Target {
@@ -55,6 +45,22 @@ struct AzureClient::Target {
     std::unique_ptr<HttpConnection> http;
     std::string token;
     std::int64_t tokenExpiry = 0;  // seconds since 1970; 0: none made yet
+    std::uint64_t id = 0;          // names its signatures in the log's masks
+    // What the service said about sizes: the smallest message it refused as
+    // too large (0: none yet) and the largest it accepted. Later messages are
+    // cut below the refused size, so a target with a lower limit than
+    // configured costs refused requests once, not in every batch.
+    std::size_t refusedBytes = 0;
+    std::size_t acceptedBytes = 0;
+
+    void Accepted(std::size_t bytes) {
+        acceptedBytes = std::max(acceptedBytes, bytes);
+        if (refusedBytes != 0 && bytes >= refusedBytes) refusedBytes = 0;  // the limit was raised
+    }
+    void TooLarge(std::size_t bytes) {
+        if (refusedBytes == 0 || bytes < refusedBytes) refusedBytes = bytes;
+        if (acceptedBytes >= bytes) acceptedBytes = 0;  // the limit was lowered
+    }
 
     ~Target() {
         if (!token.empty()) OPENSSL_cleanse(token.data(), token.size());
@@ -77,14 +83,18 @@ AzureClient::Target* AzureClient::FindOrAddTarget(const std::string& connectionT
     const std::string key = connectionText + '\n' + entity + (eventHub ? "\nEH" : "\nSB");
     if (const auto it = m_targets.find(key); it != m_targets.end()) return it->second.get();
     // Targets come from a fixed list of connections; a bound guards against a caller that varies them.
-    if (m_targets.size() >= 64) m_targets.clear();
+    if (m_targets.size() >= 64) {
+        for (const auto& [text, old] : m_targets) m_log.DropSignatures(old->id);
+        m_targets.clear();
+    }
 
     auto target = std::make_unique<Target>();
     target->connection = std::move(connection);
     target->entity = entity;
     target->eventHub = eventHub;
+    target->id = m_nextTargetId++;
     const ConnectionString& c = target->connection;
-    target->name = c.NamespaceName() + "/" + entity;
+    target->name = c.NamespaceName() + "/" + Shorten(entity);
     const std::string host = c.host.find(':') != std::string::npos ? "[" + c.host + "]" : c.host;
     target->resourceUri = std::string(c.emulator ? "http://" : "https://") + host +
                           (c.port ? ":" + std::to_string(c.port) : "") + "/" + entity;
@@ -95,9 +105,8 @@ AzureClient::Target* AzureClient::FindOrAddTarget(const std::string& connectionT
     transport.caFile = m_options.caFile;
     target->http = std::make_unique<HttpConnection>(std::move(transport));
     m_log.AddSecret(c.key);
-    m_log.AddSecret(PercentEncode(c.key));
     m_log.AddSecret(c.sharedSignature);
-    m_log.AddSecret(SignatureOf(c.sharedSignature));
+    m_log.AddSignature(target->id, SignatureOf(c.sharedSignature));
     Target* result = target.get();
     m_targets.emplace(key, std::move(target));
     return result;
@@ -118,7 +127,8 @@ bool AzureClient::Begin(std::u16string_view connectionString, std::u16string_vie
     std::string error;
     auto connection = ParseConnectionString(text, error);
     if (!connection) {
-        m_log.Error("Azure batch not opened: the connection string is not valid: " + error);
+        m_log.Error("Azure batch not opened: the connection string is not valid: " +
+                    Shorten(error, 4 * kMaxQuotedChars));
         return false;
     }
     std::string entity = ToUtf8(entityName);
@@ -127,8 +137,8 @@ bool AzureClient::Begin(std::u16string_view connectionString, std::u16string_vie
         entity = connection->entityPath;
     } else if (!connection->entityPath.empty() && !EqualIgnoringCase(entity, connection->entityPath)) {
         m_log.Error("Azure batch not opened for " + where + ": the " + (eventHub ? "Event Hub" : "queue") +
-                    " name '" + entity + "' differs from the connection string's EntityPath '" +
-                    connection->entityPath + "'");
+                    " name '" + Shorten(entity) + "' differs from the connection string's EntityPath '" +
+                    Shorten(connection->entityPath) + "'");
         return false;
     }
     if (entity.empty()) {
@@ -137,8 +147,8 @@ bool AzureClient::Begin(std::u16string_view connectionString, std::u16string_vie
         return false;
     }
     if (!IsValidEntityName(entity)) {
-        m_log.Error("Azure batch not opened for " + where + ": '" + entity +
-                    "' is not a valid entity name (letters, digits, . - _ and /)");
+        m_log.Error("Azure batch not opened for " + where + ": '" + Shorten(entity) +
+                    "' is not a valid entity name (letters, digits, . - _ and /, at most 260)");
         return false;
     }
     Target* target = FindOrAddTarget(text, std::move(*connection), entity, eventHub);
@@ -170,7 +180,7 @@ bool AzureClient::Add(const Row& input) {
     const std::size_t bytes = m_rows->Add(row);
     if (m_rows->SingleRowMessageSize(bytes) > m_maxMessageBytes) {
         m_rows->RemoveLast();
-        m_log.Error("Azure row not added for " + m_current->name + ": variable '" + ToUtf8(row.variable) +
+        m_log.Error("Azure row not added for " + m_current->name + ": variable '" + Shorten(ToUtf8(row.variable)) +
                     "' needs " + std::to_string(bytes) + " bytes, more than a message may hold (" +
                     std::to_string(m_maxMessageBytes) + ")");
         return false;
@@ -185,7 +195,7 @@ const std::string& AzureClient::Token(Target& target, bool renew) {
     if (renew || target.token.empty() || now >= target.tokenExpiry - m_options.tokenRenewBefore.count()) {
         const std::int64_t expiry = now + m_options.tokenValidity.count();
         SasToken token = MakeSasToken(target.resourceUri, c.keyName, c.key, expiry);
-        m_log.AddSecret(token.signature);
+        m_log.AddSignature(target.id, token.signature);
         if (!target.token.empty()) OPENSSL_cleanse(target.token.data(), target.token.size());
         target.token = std::move(token.token);
         target.tokenExpiry = expiry;
@@ -193,7 +203,32 @@ const std::string& AzureClient::Token(Target& target, bool renew) {
     return target.token;
 }
 
-AzureClient::MessageResult AzureClient::SendMessage(std::size_t first, std::size_t last, Clock::time_point deadline) {
+std::string AzureClient::Describe(const HttpResponse& response) const {
+    if (response.status == 0) {
+        return (response.tlsFailure ? "TLS failure: " : "transport error: ") + m_log.Quote(response.transportError);
+    }
+    std::string text = "HTTP " + std::to_string(response.status);
+    const std::string detail = ServiceErrorText(response);
+    if (!detail.empty()) text += " (" + m_log.Quote(detail) + ")";
+    return text;
+}
+
+std::string AzureClient::TargetName() const {
+    return m_current->name + (m_current->eventHub ? " (Event Hub)" : " (queue)");
+}
+
+void AzureClient::ReportError(std::string_view text) { m_log.Error(Shorten(text, 4 * kMaxQuotedChars)); }
+
+std::size_t AzureClient::MessageLimit(const Target& target) const {
+    if (target.refusedBytes == 0) return m_maxMessageBytes;
+    // Below the refused size: what is known to pass, or half the refused size
+    // while nothing that large has passed yet (as halving the message would).
+    const std::size_t learned = std::max(target.acceptedBytes, target.refusedBytes / 2);
+    return std::max<std::size_t>(1, std::min(m_maxMessageBytes, learned));
+}
+
+AzureClient::MessageOutcome AzureClient::SendMessage(std::size_t first, std::size_t last,
+                                                     Clock::time_point deadline) {
     Target& target = *m_current;
     const std::string body = m_rows->Compose(first, last);
     const std::size_t rows = last - first;
@@ -204,8 +239,8 @@ AzureClient::MessageResult AzureClient::SendMessage(std::size_t first, std::size
     while (true) {
         const auto remaining = duration_cast<milliseconds>(deadline - Clock::now());
         if (remaining <= milliseconds(0)) {
-            Fail(rows, "the send time bound of " + std::to_string(m_options.sendBudget.count()) + " ms ran out");
-            return MessageResult::Failed;
+            return {MessageResult::Failed,
+                    "the send time bound of " + std::to_string(m_options.sendBudget.count()) + " ms ran out"};
         }
         const std::vector<std::string> headers = {
             "Authorization: " + Token(target, false),
@@ -224,48 +259,46 @@ AzureClient::MessageResult AzureClient::SendMessage(std::size_t first, std::size
             case Outcome::Accepted:
                 ++m_lastSend.messages;
                 m_lastSend.bytes += body.size();
-                return MessageResult::Accepted;
+                target.Accepted(body.size());
+                return {MessageResult::Accepted, {}};
             case Outcome::TooLarge:
+                target.TooLarge(body.size());
                 m_log.Info("Azure " + target.name + " refused a message of " + std::to_string(body.size()) +
-                           " bytes as too large (" + Describe(response) + "); splitting it");
-                return MessageResult::TooLarge;
+                           " bytes (" + std::to_string(rows) + " rows) as too large (" + Describe(response) +
+                           "); messages to it are cut to " + std::to_string(MessageLimit(target)) +
+                           " bytes from now on");
+                return {MessageResult::TooLarge, Describe(response)};
             case Outcome::Unauthorized:
                 if (renewed || !target.connection.sharedSignature.empty()) {
-                    Fail(rows, Describe(response));
-                    return MessageResult::Failed;
+                    return {MessageResult::Failed, Describe(response)};
                 }
                 renewed = true;
                 Token(target, true);
                 m_log.Info("Azure " + target.name + " refused the token; retrying once with a new one");
                 continue;
             case Outcome::Permanent:
-                Fail(rows, Describe(response));
-                return MessageResult::Failed;
+                // A malformed message concerns that message only; every other
+                // refusal (403, 404, 410, TLS, ...) concerns the target.
+                return {response.status == 400 ? MessageResult::Refused : MessageResult::Failed,
+                        Describe(response)};
             case Outcome::Transient:
                 break;
         }
         if (attempt >= m_options.maxRetries) {
-            Fail(rows, Describe(response) + " after " + std::to_string(attempt + 1) + " attempts");
-            return MessageResult::Failed;
+            return {MessageResult::Failed, Describe(response) + " after " + std::to_string(attempt + 1) + " attempts"};
         }
         const auto asked = RetryAfter(response);
         const milliseconds wait = asked ? *asked : m_backoff.Delay(attempt);
         if (Clock::now() + wait >= deadline) {
-            Fail(rows, Describe(response) + "; waiting " + std::to_string(wait.count()) +
-                           " ms more would pass the send time bound of " +
-                           std::to_string(m_options.sendBudget.count()) + " ms");
-            return MessageResult::Failed;
+            return {MessageResult::Failed, Describe(response) + "; waiting " + std::to_string(wait.count()) +
+                                               " ms more would pass the send time bound of " +
+                                               std::to_string(m_options.sendBudget.count()) + " ms"};
         }
         ++attempt;
         m_log.Info("Azure " + target.name + ": " + Describe(response) + "; retry " + std::to_string(attempt) +
                    " of " + std::to_string(m_options.maxRetries) + " in " + std::to_string(wait.count()) + " ms");
         std::this_thread::sleep_for(wait);
     }
-}
-
-void AzureClient::Fail(std::size_t rows, const std::string& reason) {
-    m_log.Error("Azure send to " + m_current->name + (m_current->eventHub ? " (Event Hub)" : " (queue)") +
-                " failed for " + std::to_string(rows) + " rows: " + reason);
 }
 
 bool AzureClient::Send() {
@@ -278,47 +311,66 @@ bool AzureClient::Send() {
     const auto deadline = start + m_options.sendBudget;
     const std::size_t count = m_rows->Count();
 
-    // Greedy cut into messages as large as the limit allows.
-    std::deque<std::pair<std::size_t, std::size_t>> pending;
+    std::size_t refusedRows = 0, refusedMessages = 0;
+    std::string refusal;       // why the first refused message was refused
+    std::size_t unsentRows = 0;
+    std::string stop;          // why the send ended before the last row
+    std::size_t maxRows = count;  // after a too-large answer: fewer rows than that message held
     for (std::size_t first = 0; first < count;) {
+        // Greedy cut: as many rows as the target's size limit allows, at least one.
+        const std::size_t limit = MessageLimit(*m_current);
         std::size_t last = first + 1;
-        while (last < count && m_rows->MessageSize(first, last + 1) <= m_maxMessageBytes) ++last;
-        pending.emplace_back(first, last);
-        first = last;
-    }
-    bool ok = true;
-    while (ok && !pending.empty()) {
-        const auto [first, last] = pending.front();
-        pending.pop_front();
-        switch (SendMessage(first, last, deadline)) {
+        while (last < count && last - first < maxRows && m_rows->MessageSize(first, last + 1) <= limit) ++last;
+        const std::size_t rows = last - first;
+        MessageOutcome outcome = SendMessage(first, last, deadline);
+        if (outcome.result == MessageResult::TooLarge && rows == 1) {
+            outcome.result = MessageResult::Refused;
+            outcome.reason = "a single row is too large for the service: " + outcome.reason;
+        }
+        maxRows = count;
+        switch (outcome.result) {
             case MessageResult::Accepted:
-                m_lastSend.rows += last - first;
+                m_lastSend.rows += rows;
+                first = last;
                 break;
             case MessageResult::TooLarge:
-                if (last - first == 1) {
-                    Fail(1, "the service refuses even a message of a single row as too large");
-                    ok = false;
-                    break;
-                }
-                {
-                    const std::size_t middle = first + (last - first) / 2;
-                    pending.emplace_front(middle, last);
-                    pending.emplace_front(first, middle);
-                }
+                maxRows = rows - 1;  // cut again, below the refused size
+                break;
+            case MessageResult::Refused:
+                ++refusedMessages;
+                refusedRows += rows;
+                if (refusal.empty()) refusal = outcome.reason;
+                first = last;
+                m_log.Info("Azure " + TargetName() + " refused a message of " + std::to_string(rows) + " rows (" +
+                           outcome.reason + "); " + std::to_string(m_lastSend.rows) + " rows delivered so far, " +
+                           std::to_string(count - first) + " still to send");
                 break;
             case MessageResult::Failed:
-                ok = false;
+                unsentRows = count - first;
+                stop = outcome.reason;
+                first = count;
                 break;
         }
     }
-    if (ok && m_log.InfoEnabled()) {
+    const std::size_t failed = refusedRows + unsentRows;
+    if (failed > 0) {
+        std::string text = "Azure send to " + TargetName() + " failed for " + std::to_string(failed) + " of " +
+                           std::to_string(count) + " rows (" + std::to_string(m_lastSend.rows) + " delivered): ";
+        if (refusedRows > 0) {
+            text += std::to_string(refusedRows) + " rows in " + std::to_string(refusedMessages) +
+                    (refusedMessages == 1 ? " message" : " messages") + " refused (" + refusal + ")";
+            if (unsentRows > 0) text += "; ";
+        }
+        if (unsentRows > 0) text += std::to_string(unsentRows) + " rows not sent: " + stop;
+        m_log.Error(text);
+    } else if (m_log.InfoEnabled()) {
         m_log.Info("Azure " + m_current->name + ": sent " + std::to_string(m_lastSend.rows) + " rows in " +
                    std::to_string(m_lastSend.messages) + " messages (" + std::to_string(m_lastSend.bytes) +
                    " bytes, " + std::to_string(m_lastSend.requests) + " requests) in " +
                    std::to_string(duration_cast<milliseconds>(Clock::now() - start).count()) + " ms");
     }
     m_rows.reset();  // the batch is closed, sent or not
-    return ok;
+    return failed == 0;
 }
 
 }  // namespace corvell

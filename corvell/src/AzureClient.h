@@ -53,17 +53,30 @@ public:
     bool Send();
 
     const SendStats& LastSend() const { return m_lastSend; }
+    // An error record through the client's masking and bounds.
+    void ReportError(std::string_view text);
 
 private:
     struct Target;
-    enum class MessageResult { Accepted, TooLarge, Failed };
+    enum class MessageResult {
+        Accepted,
+        TooLarge,  // cut it smaller, or drop it when it holds a single row
+        Refused,   // this message is refused for good (400): drop it, go on with the rest
+        Failed     // the target refuses, or time ran out: end the send
+    };
+    struct MessageOutcome {
+        MessageResult result = MessageResult::Failed;
+        std::string reason;  // why it was not accepted, for the records
+    };
 
     Target* FindOrAddTarget(const std::string& connectionText, ConnectionString connection,
                             const std::string& entity, bool eventHub);
-    MessageResult SendMessage(std::size_t first, std::size_t last,
-                              std::chrono::steady_clock::time_point deadline);
+    std::size_t MessageLimit(const Target& target) const;
+    MessageOutcome SendMessage(std::size_t first, std::size_t last,
+                               std::chrono::steady_clock::time_point deadline);
     const std::string& Token(Target& target, bool renew);
-    void Fail(std::size_t rows, const std::string& reason);
+    std::string Describe(const HttpResponse& response) const;
+    std::string TargetName() const;
 
     Log m_log;
     ProxySettings m_proxy;
@@ -72,7 +85,8 @@ private:
     std::map<std::string, std::unique_ptr<Target>> m_targets;  // by connection string, entity and kind
     Target* m_current = nullptr;                               // target of the open batch
     std::optional<RowBuffer> m_rows;                           // the open batch
-    std::size_t m_maxMessageBytes = 0;
+    std::size_t m_maxMessageBytes = 0;  // the configured bound for the open batch's kind of target
+    std::uint64_t m_nextTargetId = 1;
     SendStats m_lastSend;
 };
 

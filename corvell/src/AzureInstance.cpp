@@ -16,7 +16,7 @@ namespace {
 
 class AzureInstance final : public IAzureInstance {
 public:
-    AzureInstance(ILogger* logger, ProxySettings proxy) : m_logger(logger), m_client(logger, std::move(proxy)) {}
+    AzureInstance(ILogger* logger, ProxySettings proxy) : m_client(logger, std::move(proxy)) {}
     ~AzureInstance() = default;
 
     void Reserved1() override {}
@@ -63,13 +63,8 @@ private:
         return false;
     }
 
-    void Report(const char* what) {
-        if (!m_logger) return;
-        const std::u16string text = ToUtf16(std::string("Azure operation failed: ") + what);
-        m_logger->LogError(text.c_str());
-    }
+    void Report(const char* what) { m_client.ReportError(std::string("Azure operation failed: ") + what); }
 
-    ILogger* m_logger;
     AzureClient m_client;
 };
 

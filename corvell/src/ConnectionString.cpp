@@ -4,6 +4,8 @@
 #include <cctype>
 #include <charconv>
 
+#include "Utf.h"
+
 namespace corvell {
 
 namespace {
@@ -34,7 +36,7 @@ bool ParseEndpoint(const std::string& endpoint, ConnectionString& out, std::stri
     }
     const std::string scheme = lower.substr(0, schemeEnd);
     if (scheme != "sb" && scheme != "https") {
-        error = "the Endpoint scheme '" + scheme + "' is not supported (expected sb://)";
+        error = "the Endpoint scheme '" + Shorten(scheme) + "' is not supported (expected sb://)";
         return false;
     }
     std::string rest = lower.substr(schemeEnd + 3);
@@ -101,7 +103,7 @@ std::string ConnectionString::NamespaceName() const {
     }) || host.find(':') != std::string::npos;
     std::string name = isAddress ? host : host.substr(0, host.find('.'));
     if (port != 0) name += ":" + std::to_string(port);
-    return name;
+    return Shorten(name);
 }
 
 bool IsLoopbackHost(const std::string& host) {

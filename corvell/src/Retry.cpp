@@ -6,6 +6,7 @@
 #include <cctype>
 #include <charconv>
 #include <cmath>
+#include <cstring>
 
 namespace corvell {
 
@@ -22,6 +23,28 @@ std::optional<double> ParseNumber(const std::string& text) {
     const auto [ptr, ec] = std::from_chars(text.data(), end, value);
     if (ec != std::errc() || ptr != end || !std::isfinite(value) || value < 0) return std::nullopt;
     return value;
+}
+
+// The five predefined entities; the error document uses no others.
+std::string XmlUnescape(const std::string& text) {
+    static const std::pair<const char*, char> kEntities[] = {
+        {"&amp;", '&'}, {"&lt;", '<'}, {"&gt;", '>'}, {"&quot;", '"'}, {"&apos;", '\''}};
+    std::string out;
+    for (std::size_t i = 0; i < text.size(); ++i) {
+        bool replaced = false;
+        if (text[i] == '&') {
+            for (const auto& [entity, c] : kEntities) {
+                if (text.compare(i, std::strlen(entity), entity) == 0) {
+                    out.push_back(c);
+                    i += std::strlen(entity) - 1;
+                    replaced = true;
+                    break;
+                }
+            }
+        }
+        if (!replaced) out.push_back(text[i]);
+    }
+    return out;
 }
 
 }  // namespace
@@ -88,7 +111,7 @@ std::string ServiceErrorText(const HttpResponse& response) {
     const auto open = text.find("<Detail>");
     const auto close = text.find("</Detail>");
     if (open != std::string::npos && close != std::string::npos && close > open)
-        text = text.substr(open + 8, close - open - 8);
+        text = XmlUnescape(text.substr(open + 8, close - open - 8));
     std::string line;
     for (const char c : text) {
         const auto u = static_cast<unsigned char>(c);
@@ -96,13 +119,6 @@ std::string ServiceErrorText(const HttpResponse& response) {
             if (!line.empty() && line.back() != ' ') line.push_back(' ');
         } else {
             line.push_back(c);
-        }
-        if (line.size() >= 300) {
-            // Cut at a character boundary of UTF-8.
-            while (!line.empty() && (static_cast<unsigned char>(line.back()) & 0xC0) == 0x80) line.pop_back();
-            if (!line.empty() && static_cast<unsigned char>(line.back()) >= 0xC0) line.pop_back();
-            line += "...";
-            break;
         }
     }
     while (!line.empty() && line.back() == ' ') line.pop_back();

@@ -24,8 +24,9 @@ Outcome Classify(const HttpResponse& response);
 // Retry-After in seconds), if any.
 std::optional<std::chrono::milliseconds> RetryAfter(const HttpResponse& response);
 
-// The service's own error text, short and on one line: the Detail of an Azure
-// error document, else the start of the body.
+// The service's own error text on one line: the Detail of an Azure error
+// document, else the body (at most what HttpResponse keeps). Records quote it
+// masked and shortened (Log::Quote).
 std::string ServiceErrorText(const HttpResponse& response);
 
 // Exponential back-off with jitter: first * 2^attempt * [0.8, 1.3], at most cap.

@@ -66,4 +66,16 @@ std::u16string ToUtf16(std::string_view text) {
     return out;
 }
 
+std::string Shorten(std::string_view text, std::size_t limit) {
+    // Count characters by their first bytes; continuation bytes (10xxxxxx) belong to the one before.
+    std::size_t characters = 0, cut = text.size();
+    for (std::size_t i = 0; i < text.size(); ++i) {
+        if ((static_cast<unsigned char>(text[i]) & 0xC0) == 0x80) continue;
+        if (characters == limit) cut = i;
+        ++characters;
+    }
+    if (characters <= limit) return std::string(text);
+    return std::string(text.substr(0, cut)) + "...(" + std::to_string(characters - limit) + " more characters)";
+}
+
 }  // namespace corvell

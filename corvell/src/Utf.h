@@ -49,4 +49,10 @@ std::u16string_view View(const char16_t* text);
 // UTF-16 form of a UTF-8 text; malformed sequences become U+FFFD.
 std::u16string ToUtf16(std::string_view text);
 
+// Names and service texts quoted in log records keep at most this many characters.
+constexpr std::size_t kMaxQuotedChars = 256;
+// A UTF-8 text cut after limit characters (code points), marked
+// "...(N more characters)" when cut, so a record stays readable whatever it quotes.
+std::string Shorten(std::string_view text, std::size_t limit = kMaxQuotedChars);
+
 }  // namespace corvell

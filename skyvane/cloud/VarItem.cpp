@@ -89,6 +89,13 @@ bool CVarItemRtData::Update(const VARIANT* value, DWORD statusLow, DWORD statusH
 
 bool CVarItemRtData::SetValue(const CString& text, double number, bool isText, DWORD statusLow, DWORD statusHigh,
                               const DATE* time) {
+    // The time first: a report whose time cannot be stored stores nothing, so
+    // no value is ever exported with the time of the report before it.
+    SYSTEMTIME st{};
+    if (!time || !ConvertDATE2Systemtime(*time, &st)) return false;  // no usable time stamp
+    LONGLONG seconds = 0;  // 0 for a year before 1900
+    if (st.wYear >= 1900 && !LocalTimeToSeconds(st, seconds)) return false;
+
     CSingleLock lock(&m_cs, true);
     m_dwStatusLow = statusLow;
     m_dwStatusHigh = statusHigh;
@@ -96,12 +103,7 @@ bool CVarItemRtData::SetValue(const CString& text, double number, bool isText, D
     m_dValue = number;
     m_bIsString = isText;
     m_bValid = true;
-
-    SYSTEMTIME st{};
-    if (!time || !ConvertDATE2Systemtime(*time, &st)) return false;  // no usable time stamp
-    LONGLONG seconds = 0;
-    if (st.wYear >= 1900 && !LocalTimeToSeconds(st, seconds)) return false;
-    m_time = seconds;  // 0 for a year before 1900
+    m_time = seconds;
     m_wMilliseconds = st.wMilliseconds;
     return true;
 }

@@ -29,11 +29,11 @@ public:
     // everything else a number and an empty text, or false when it is none.
     static bool ConvertValue(const VARIANT* value, CString& text, double& number, bool& isText);
 
-    // Stores value, status and flags, then the time: a DATE before 1900
+    // Stores value, status, flags and time together: a DATE before 1900
     // stores time 0; otherwise the local calendar time (daylight saving as
     // the system decides for that date) must lie from 1970-01-01 00:00:00 to
     // 3000-12-31 23:59:59 UTC. A time stamp outside that, or none at all,
-    // keeps the former time and milliseconds and gives false.
+    // stores nothing and gives false.
     bool SetValue(const CString& text, double number, bool isText, DWORD statusLow, DWORD statusHigh,
                   const DATE* time);
 

@@ -4,24 +4,26 @@
 #include "frame/ModuleLog.h"
 #include "res/StringTable.h"
 
-#include "vxhelper/messagebox.h"
+#include "vxhelper/logwriter.h"
 
 #define SKYVANE_EXPORT extern "C" __attribute__((visibility("default")))
 
 namespace {
 
-void WriteMessageBoxRecord(const CString& text) { CModuleLog::LogError(text); }
+void WriteErrorRecord(const CString& text) { CModuleLog::LogError(text); }
+void WriteInfoRecord(const CString& text) { CModuleLog::LogInfo(text); }
 
-// While the module is loaded, message boxes of a headless host are written to its log.
-struct MessageBoxLog {
-    MessageBoxLog() { VXHelper_SetMessageLogWriter(&WriteMessageBoxRecord); }
-    ~MessageBoxLog() { VXHelper_SetMessageLogWriter(nullptr); }
+// While the module is loaded, the helper library's records (message boxes of
+// a headless host, a settings file changing its encoding) go to its log.
+struct HelperLibraryLog {
+    HelperLibraryLog() { VXHelper_SetLogWriters(&WriteErrorRecord, &WriteInfoRecord); }
+    ~HelperLibraryLog() { VXHelper_SetLogWriters(nullptr, nullptr); }
 };
 
 // In this order: the string table and the log writer exist before the
 // module object and go after it.
 CStringTableRegistration g_strings(kModuleStrings, kModuleStringCount);
-MessageBoxLog g_messageBoxLog;
+HelperLibraryLog g_helperLibraryLog;
 CMainSkyvane g_module;
 
 }  // namespace

@@ -163,8 +163,8 @@ TEST(Answers, RetryAfterAndErrorText) {
 
     r.body = "<Error><Code>404</Code><Detail>The entity\r\nwas not found.</Detail></Error>";
     EXPECT_EQ(ServiceErrorText(r), "The entity was not found.");
-    r.body = std::string(1000, 'x');
-    EXPECT_EQ(ServiceErrorText(r).size(), 303u);
+    r.body = "<Error><Detail>a &lt;b&gt; &amp;amp; &quot;c&quot; &apos;d&apos; &#38;</Detail></Error>";
+    EXPECT_EQ(ServiceErrorText(r), "a <b> &amp; \"c\" 'd' &#38;");
 
     Backoff backoff(std::chrono::milliseconds(800), std::chrono::milliseconds(5000));
     for (int attempt = 0; attempt < 3; ++attempt) {
@@ -189,6 +189,35 @@ TEST(LogRecords, SecretsAreMaskedEverywhere) {
     logger.infoEnabled = false;
     log.Info("not written");
     EXPECT_EQ(logger.Records().size(), 2u);
+
+    // A signature in every spelling: as in the token, plain base64, lower-case escapes, base64url.
+    log.AddSignature(1, "ab+/cdEFgh%2B%2Fij%3D");
+    EXPECT_EQ(log.Mask("ab+/cdEFgh%2B%2Fij%3D | ab+/cdEFgh+/ij= | ab%2b%2fcdEFgh%2b%2fij%3d | ab-_cdEFgh-_ij | "
+                       "ab+/cdEFgh+/ij"),
+              "*** | *** | *** | *** | ***");
+    // A renewed token's signature joins the last one; the one before that is dropped.
+    log.AddSignature(1, "second-signature-text");
+    log.AddSignature(1, "third-signature-text");
+    EXPECT_EQ(log.Mask("ab+/cdEFgh+/ij= second-signature-text third-signature-text"),
+              "ab+/cdEFgh+/ij= *** ***");
+
+    // Tokens and keys never seen are masked by their names.
+    EXPECT_EQ(log.Mask("got 'SharedAccessSignature sr=x%3A&sig=AbC&se=1&skn=k' and sig=QQ%3D&se=2"),
+              "got 'SharedAccessSignature ***' and sig=***&se=2");
+    EXPECT_EQ(log.Mask("Endpoint=sb://n/;SharedAccessSignature=SharedAccessSignature sr=a&sig=b;EntityPath=q"),
+              "Endpoint=sb://n/;SharedAccessSignature=SharedAccessSignature ***;EntityPath=q");
+    EXPECT_EQ(log.Mask("SharedAccessKeyName=Root;SharedAccessKey=c2VjcmV0=;x"),
+              "SharedAccessKeyName=Root;SharedAccessKey=***;x");
+    EXPECT_EQ(log.Quote(std::string(300, 'x') + " sig=" + std::string(300, 'y')),
+              std::string(256, 'x') + "...(52 more characters)");
+}
+
+TEST(LogRecords, QuotedTextsAreShortenedByCharacters) {
+    EXPECT_EQ(Shorten("abc", 3), "abc");
+    EXPECT_EQ(Shorten("abcd", 3), "abc...(1 more characters)");
+    EXPECT_EQ(Shorten("\xC3\xA4\xF0\x9F\x98\x80\xC3\xA4x", 2), "\xC3\xA4\xF0\x9F\x98\x80...(2 more characters)")
+        << "never cuts inside a character";
+    EXPECT_EQ(Shorten(std::string(300000, 'n')), std::string(kMaxQuotedChars, 'n') + "...(299744 more characters)");
 }
 
 TEST(TextConversion, MalformedInputBecomesReplacementCharacters) {

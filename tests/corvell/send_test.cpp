@@ -11,6 +11,8 @@
 
 #include <chrono>
 #include <cmath>
+#include <cstdio>
+#include <set>
 
 #include "AzureClient.h"
 #include "AzureLocalProcess.h"
@@ -121,6 +123,34 @@ int FreePortWithNothingListening() {
     getsockname(fd, reinterpret_cast<sockaddr*>(&address), &length);
     close(fd);
     return ntohs(address.sin_port);
+}
+
+// The counts of a send's error record: failed, of total, delivered.
+struct SendCounts {
+    std::size_t failed = 0, total = 0, delivered = 0;
+};
+SendCounts CountsOf(const std::string& record) {
+    SendCounts counts;
+    const auto at = record.find("failed for ");
+    const bool found = at != std::string::npos &&
+                       std::sscanf(record.c_str() + at, "failed for %zu of %zu rows (%zu delivered)", &counts.failed,
+                                   &counts.total, &counts.delivered) == 3;
+    EXPECT_TRUE(found) << record;
+    return counts;
+}
+
+// Rows with JSON bodies of about 100 bytes each, whose variable names can be
+// matched in a body ("Row42," cannot be found inside "Row420,").
+std::vector<TestRow> NumberedRows(std::size_t n) {
+    std::vector<TestRow> rows = MakeRows(n);
+    for (std::size_t i = 0; i < n; ++i) rows[i].variable = u"Row" + QString::number(i).toStdU16String() + u",";
+    return rows;
+}
+
+std::set<std::string> ArrivedNames(const std::vector<azurelocal::ReceivedRow>& received) {
+    std::set<std::string> names;
+    for (const auto& r : received) names.insert(r.row.variable);
+    return names;
 }
 
 class SendTest : public ::testing::Test {
@@ -288,6 +318,120 @@ TEST_F(SendTest, ARowLargerThanAnyMessageIsRefusedAlone) {
     EXPECT_LE(server().Stats().requests, 10u);
 }
 
+TEST_F(SendTest, ARefusedMessageIsDroppedAloneAndTheRestArrive) {
+    ClientOptions options = FastOptions();
+    options.serviceBusMessageBytes = 4096;  // about 40 rows a message
+    options.headroomBytes = 256;
+    AzureClient client(&logger, {}, options);
+    const auto rows = NumberedRows(300);
+
+    // A 400 for the message holding one row, and one for the third message: both are dropped alone.
+    ASSERT_TRUE(server().Fault("status=400&match=%22Row77,%22"));
+    ASSERT_TRUE(server().Fault("status=400&at=3"));
+    EXPECT_FALSE(SendRows(client, server().ConnectionString(), "q", false, 1, rows));
+    const auto received = server().Rows();
+    const auto names = ArrivedNames(received);
+    EXPECT_EQ(names.count("Row77,"), 0u);
+    EXPECT_EQ(names.count("Row299,"), 1u) << "the rows after the refused messages arrive";
+    ASSERT_EQ(logger.Errors().size(), 1u) << logger.All();
+    const SendCounts counts = CountsOf(logger.Errors()[0]);
+    EXPECT_EQ(counts.total, rows.size());
+    EXPECT_EQ(counts.delivered, received.size());
+    EXPECT_EQ(counts.failed + counts.delivered, rows.size());
+    EXPECT_GT(counts.failed, 40u);  // two whole messages
+    EXPECT_NE(logger.Errors()[0].find("in 2 messages refused (HTTP 400 (injected fault))"), std::string::npos)
+        << logger.Errors()[0];
+    EXPECT_EQ(client.LastSend().rows, received.size());
+
+    // A single row too large for the service even alone is dropped; the others arrive.
+    ASSERT_TRUE(server().Reset());
+    logger.Clear();
+    AzureClient believing(&logger, {}, FastOptions());  // believes 256 KB fit
+    ASSERT_TRUE(server().SetLimit(3000));
+    std::vector<TestRow> withHuge = NumberedRows(60);
+    withHuge[30].isText = true;
+    withHuge[30].text = std::u16string(4000, u'x');
+    EXPECT_FALSE(SendRows(believing, server().ConnectionString(), "q", false, 1, withHuge));
+    EXPECT_EQ(server().Rows().size(), 59u);
+    ASSERT_EQ(logger.Errors().size(), 1u) << logger.All();
+    const SendCounts single = CountsOf(logger.Errors()[0]);
+    EXPECT_EQ(single.failed, 1u);
+    EXPECT_EQ(single.delivered, 59u);
+    EXPECT_NE(logger.Errors()[0].find("a single row is too large"), std::string::npos) << logger.Errors()[0];
+}
+
+TEST_F(SendTest, ARefusalOfTheTargetEndsTheSendAtOnce) {
+    ClientOptions options = FastOptions();
+    options.serviceBusMessageBytes = 4096;
+    options.headroomBytes = 256;
+    AzureClient client(&logger, {}, options);
+    const auto rows = NumberedRows(300);
+    for (const char* fault : {"status=404&at=2", "status=410&at=2", "status=403&at=2", "status=401&at=2&count=2"}) {
+        ASSERT_TRUE(server().Reset());
+        logger.Clear();
+        ASSERT_TRUE(server().Fault(fault));
+        EXPECT_FALSE(SendRows(client, server().ConnectionString(), "q", false, 1, rows));
+        const auto stats = server().Stats();
+        EXPECT_EQ(stats.requests, std::string(fault).find("401") != std::string::npos ? 3u : 2u) << fault;
+        ASSERT_EQ(logger.Errors().size(), 1u) << logger.All();
+        const SendCounts counts = CountsOf(logger.Errors()[0]);
+        EXPECT_EQ(counts.delivered, stats.rows) << fault;
+        EXPECT_EQ(counts.failed, rows.size() - stats.rows) << fault;
+        EXPECT_NE(logger.Errors()[0].find(" rows not sent: HTTP "), std::string::npos) << logger.Errors()[0];
+    }
+}
+
+TEST_F(SendTest, ARefusedSizeIsRememberedPerTarget) {
+    AzureClient client(&logger, {}, FastOptions());  // believes 1 MB fit an Event Hub
+    ASSERT_TRUE(server().SetLimit(256 * 1024, "event-hub"));
+    const auto rows = MakeRows(12000);  // about 1.2 MB of JSON
+    ASSERT_TRUE(SendRows(client, server().ConnectionString(), "hub", true, 1, rows)) << logger.All();
+    auto stats = server().Stats();
+    EXPECT_EQ(stats.rows, rows.size());
+    EXPECT_GT(stats.tooLarge, 0u);
+    EXPECT_LE(stats.tooLarge, 2u) << "later messages of the first batch are cut below the refused size";
+    for (int batch = 0; batch < 3; ++batch) {
+        const auto before = server().Stats();
+        ASSERT_TRUE(SendRows(client, server().ConnectionString(), "hub", true, 1, rows)) << logger.All();
+        stats = server().Stats();
+        EXPECT_EQ(stats.tooLarge, before.tooLarge) << "batch " << batch + 2 << " needs no refused request";
+        EXPECT_EQ(stats.rows - before.rows, rows.size());
+        EXPECT_GT((stats.bytes - before.bytes) / (stats.messages - before.messages), 200u * 1024)
+            << "messages stay close to the limit";
+    }
+    // Another target of the same client keeps its own limit: a Service Bus queue takes 256 KB as configured.
+    const auto before = server().Stats();
+    ASSERT_TRUE(SendRows(client, server().ConnectionString(), "queue", false, 1, rows)) << logger.All();
+    EXPECT_EQ(server().Stats().tooLarge, before.tooLarge);
+    EXPECT_TRUE(logger.Errors().empty()) << logger.All();
+}
+
+TEST_F(SendTest, RecordsQuoteNamesAndServiceTextsWithinABound) {
+    AzureClient client(&logger, {}, FastOptions());
+    const std::u16string connection = QString::fromStdString(server().ConnectionString()).toStdU16String();
+    ASSERT_TRUE(client.Begin(connection, u"q", false, 1));
+    TestRow huge = MakeRows(1)[0];
+    huge.variable = std::u16string(300000, u'v');
+    EXPECT_FALSE(client.Add(ToRow(huge)));
+    EXPECT_FALSE(client.Begin(connection, std::u16string(300000, u'e'), false, 1));
+    EXPECT_FALSE(client.Begin(u"Endpoint=" + std::u16string(300000, u's') + u"://x/;SharedAccessKeyName=k;"
+                              u"SharedAccessKey=k-text", u"q", false, 1));
+
+    // The receiver's 404 quotes the entity name of 260 characters.
+    auto limited = StartServer({"--entity", "known"});
+    ASSERT_TRUE(limited);
+    const std::string entity(260, 'n');
+    EXPECT_FALSE(SendRows(client, limited->ConnectionString(), entity, false, 1, MakeRows(2)));
+
+    const auto errors = logger.Errors();
+    ASSERT_EQ(errors.size(), 4u) << logger.All();
+    for (const std::string& record : errors) {
+        // At most two quoted texts (a target name and a service text) beside the fixed text.
+        EXPECT_LT(record.size(), 2 * 256u + 300u) << record.substr(0, 1000);
+        EXPECT_NE(record.find("more characters)"), std::string::npos) << record.substr(0, 400);
+    }
+}
+
 // --- Tokens ---------------------------------------------------------------------
 
 TEST_F(SendTest, A401RenewsTheTokenOnceAndThenSucceeds) {
@@ -446,6 +590,19 @@ TEST_F(SendTest, AnErrorTextEchoingTheTokenIsMasked) {
     ASSERT_EQ(logger.Errors().size(), 1u);
     EXPECT_NE(logger.Errors()[0].find("***"), std::string::npos) << logger.Errors()[0];
     // TearDown checks that neither the key nor the signature is in any record.
+}
+
+TEST_F(SendTest, NoSpellingOfTheSignatureOrKeyReachesARecord) {
+    AzureClient client(&logger, {}, FastOptions());
+    ASSERT_TRUE(server().Fault("kind=echo-signature&status=400"));
+    EXPECT_FALSE(SendRows(client, server().ConnectionString(), "q", false, 1, MakeRows(1)));
+    ASSERT_EQ(logger.Errors().size(), 1u);
+    EXPECT_NE(logger.Errors()[0].find("the signature *** (***) of SharedAccessSignature *** was checked with the "
+                                      "key ***"),
+              std::string::npos)
+        << logger.Errors()[0];
+
+    // TearDown checks the key and every "sig=".
 }
 
 // --- TLS and proxy --------------------------------------------------------------------

@@ -1,5 +1,6 @@
 // Message boxes without a widget application, and string tables by id.
 #include "vxhelper/messagebox.h"
+#include "vxhelper/logwriter.h"
 
 #include "platform/resources.h"
 
@@ -32,7 +33,7 @@ TEST(MessageBox, HeadlessBoxesGoToTheLogAndAnswerHarmlessly) {
     CStringTableRegistration first(older, 2);
     Seen seen;
     g_logged.clear();
-    VXHelper_SetMessageLogWriter(&RecordLogged);
+    VXHelper_SetLogWriters(&RecordLogged, nullptr);
     VXHelper_SetMessageBoxObserver(&Observe, &seen);
     {
         CStringTableRegistration second(newer, 1);
@@ -43,7 +44,7 @@ TEST(MessageBox, HeadlessBoxesGoToTheLogAndAnswerHarmlessly) {
     EXPECT_EQ(VXHelper_MessageBox(nullptr, 7999, MB_OK), IDOK);
     EXPECT_EQ(VXHelper_MessageBox(nullptr, CString(u"two\nlines"), MB_ICONERROR), IDOK);
     VXHelper_SetMessageBoxObserver(nullptr, nullptr);
-    VXHelper_SetMessageLogWriter(nullptr);
+    VXHelper_SetLogWriters(nullptr, nullptr);
     VXHelper_MessageBox(nullptr, CString(u"not seen"), MB_OK);
 
     const std::vector<std::string> expected{"new text", "old text", "only here", "(string 7999)", "two\nlines"};

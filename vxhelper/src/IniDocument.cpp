@@ -3,6 +3,7 @@
 #include "platform/text.h"
 
 #include <algorithm>
+#include <optional>
 
 namespace {
 
@@ -51,6 +52,52 @@ bool HasLineBreakOrNul(std::u16string_view text) {
     return text.find_first_of(std::u16string_view(u"\r\n\0", 3)) != std::u16string_view::npos;
 }
 
+// Windows-1252 from 0x80 to 0x9F; the five bytes it leaves undefined map to
+// the control characters of the same number, as Windows maps them.
+constexpr char16_t kCp1252High[32] = {
+    0x20AC, 0x0081, 0x201A, 0x0192, 0x201E, 0x2026, 0x2020, 0x2021, 0x02C6, 0x2030, 0x0160,
+    0x2039, 0x0152, 0x008D, 0x017D, 0x008F, 0x0090, 0x2018, 0x2019, 0x201C, 0x201D, 0x2022,
+    0x2013, 0x2014, 0x02DC, 0x2122, 0x0161, 0x203A, 0x0153, 0x009D, 0x017E, 0x0178};
+
+char16_t FromCp1252(unsigned char byte) {
+    return byte >= 0x80 && byte < 0xA0 ? kCp1252High[byte - 0x80] : static_cast<char16_t>(byte);
+}
+
+// The Windows-1252 byte of a character, or nothing when the code page lacks it.
+std::optional<char> ToCp1252(char16_t c) {
+    if (c < 0x80 || (c >= 0xA0 && c <= 0xFF)) return static_cast<char>(c);
+    for (int i = 0; i < 32; ++i)
+        if (kCp1252High[i] == c) return static_cast<char>(0x80 + i);
+    return std::nullopt;
+}
+
+// Strict UTF-8: no overlong forms, no surrogates, nothing beyond U+10FFFF.
+bool IsValidUtf8(std::string_view bytes) {
+    size_t i = 0;
+    while (i < bytes.size()) {
+        const auto b0 = static_cast<unsigned char>(bytes[i]);
+        if (b0 < 0x80) {
+            ++i;
+            continue;
+        }
+        int extra = 0;
+        char32_t cp = 0, min = 0;
+        if ((b0 & 0xE0) == 0xC0) { extra = 1; cp = b0 & 0x1F; min = 0x80; }
+        else if ((b0 & 0xF0) == 0xE0) { extra = 2; cp = b0 & 0x0F; min = 0x800; }
+        else if ((b0 & 0xF8) == 0xF0) { extra = 3; cp = b0 & 0x07; min = 0x10000; }
+        else return false;
+        if (i + static_cast<size_t>(extra) >= bytes.size()) return false;
+        for (int j = 1; j <= extra; ++j) {
+            const auto b = static_cast<unsigned char>(bytes[i + static_cast<size_t>(j)]);
+            if ((b & 0xC0) != 0x80) return false;
+            cp = (cp << 6) | (b & 0x3F);
+        }
+        if (cp < min || cp > 0x10FFFF || (cp >= 0xD800 && cp <= 0xDFFF)) return false;
+        i += static_cast<size_t>(extra) + 1;
+    }
+    return true;
+}
+
 }  // namespace
 
 // ---- reading ----------------------------------------------------------------
@@ -69,11 +116,15 @@ VX_CIniDocument VX_CIniDocument::Parse(std::string_view bytes) {
     } else if (bytes.size() >= 2 && byte(0) != 0 && byte(0) < 0x80 && byte(1) == 0) {
         // An ASCII character followed by a zero byte: UTF-16LE saved without a mark.
         doc.m_encoding = Encoding::Utf16Le;
+    } else if (!IsValidUtf8(bytes)) {
+        // No mark and no UTF-8: the ANSI code page, in which the profile
+        // functions of Windows write a file they create.
+        doc.m_encoding = Encoding::Windows1252;
     }
     bytes.remove_prefix(doc.m_bom.size());
 
     // Split at LF, in units of the encoding; a CR before it belongs to the line end.
-    const size_t unit = doc.m_encoding == Encoding::Utf8 ? 1 : 2;
+    const size_t unit = doc.UnitBytes();
     const auto unitAt = [&](size_t i) { return doc.UnitAt(bytes, i); };
     size_t start = 0;
     while (start < bytes.size()) {
@@ -106,9 +157,14 @@ void VX_CIniDocument::Classify(Line& line) const {
     if (text.empty() || text.front() == u';') return;
     if (text.front() == u'[') {
         const size_t close = text.find(u']');
-        line.kind = Kind::Section;
-        line.name = Trim(text.substr(1, close == std::u16string_view::npos ? std::u16string_view::npos : close - 1));
-        return;
+        if (close != std::u16string_view::npos) {
+            line.kind = Kind::Section;
+            line.name = Trim(text.substr(1, close - 1));
+            return;
+        }
+        // Without its "]" the line is no heading (a damaged line must not move
+        // the keys after it into a section of its own); Windows reads it like
+        // any other line: "[k=1" is the key "[k", "[broken" is ignored.
     }
     const size_t equals = text.find(u'=');
     if (equals == std::u16string_view::npos) return;
@@ -185,17 +241,37 @@ std::vector<std::u16string> VX_CIniDocument::GetKeyNames(std::u16string_view sec
 
 // ---- encoding ---------------------------------------------------------------
 
+size_t VX_CIniDocument::UnitBytes() const {
+    return m_encoding == Encoding::Utf8 || m_encoding == Encoding::Windows1252 ? 1 : 2;
+}
+
 std::u16string VX_CIniDocument::Decode(std::string_view bytes) const {
     if (m_encoding == Encoding::Utf8) return Utf8ToUtf16(bytes);
     std::u16string text;
+    if (m_encoding == Encoding::Windows1252) {
+        text.reserve(bytes.size());
+        for (const char c : bytes) text += FromCp1252(static_cast<unsigned char>(c));
+        return text;
+    }
     text.reserve(bytes.size() / 2);
     for (size_t i = 0; i + 1 < bytes.size(); i += 2) text += UnitAt(bytes, i);
     return text;
 }
 
+bool VX_CIniDocument::CanEncode(std::u16string_view text) const {
+    if (m_encoding != Encoding::Windows1252) return true;
+    return std::all_of(text.begin(), text.end(), [](char16_t c) { return ToCp1252(c).has_value(); });
+}
+
+// Only called for text CanEncode accepts: the code page never gets a replacement character.
 std::string VX_CIniDocument::Encode(std::u16string_view text) const {
     if (m_encoding == Encoding::Utf8) return Utf16ToUtf8(text);
     std::string bytes;
+    if (m_encoding == Encoding::Windows1252) {
+        bytes.reserve(text.size());
+        for (const char16_t c : text) bytes += ToCp1252(c).value_or('?');
+        return bytes;
+    }
     bytes.reserve(text.size() * 2);
     for (const char16_t c : text) {
         const char lo = static_cast<char>(c & 0xFF), hi = static_cast<char>(c >> 8);
@@ -227,12 +303,36 @@ bool VX_CIniDocument::IsValidKey(std::u16string_view key) {
 
 bool VX_CIniDocument::IsValidValue(std::u16string_view value) { return !HasLineBreakOrNul(value); }
 
+void VX_CIniDocument::ConvertToUtf16Le() {
+    std::vector<std::u16string> texts;
+    texts.reserve(m_lines.size());
+    for (const Line& line : m_lines) texts.push_back(Decode(line.raw));
+    const std::u16string newline = Decode(m_newline);
+    m_encoding = Encoding::Utf16Le;
+    m_bom = "\xFF\xFE";
+    m_newline = Encode(newline);
+    auto text = texts.begin();
+    for (Line& line : m_lines) {  // in place: the index keeps pointing at the same lines
+        line.raw = Encode(*text++);
+        line.endBytes *= 2;
+    }
+}
+
 bool VX_CIniDocument::SetValue(std::u16string_view section, std::u16string_view key, std::u16string_view value) {
     if (!IsValidSection(section) || !IsValidKey(key) || !IsValidValue(value)) return false;
     const std::u16string sectionName(Trim(section)), keyName(Trim(key));
     const std::u16string keyLine = keyName + u"=" + Quote(value);
 
-    if (const auto s = m_sectionIndex.find(Fold(sectionName)); s != m_sectionIndex.end()) {
+    // What reaches the file must fit its encoding; a code page that cannot
+    // hold it gives way to UTF-16LE for the whole file.
+    const auto found = m_sectionIndex.find(Fold(sectionName));
+    const bool keyExists = found != m_sectionIndex.end() && m_sections[found->second].keys.contains(Fold(keyName));
+    const std::u16string written = keyExists ? Quote(value)
+                                   : found != m_sectionIndex.end() ? keyLine
+                                                                   : u"[" + sectionName + u"]" + keyLine;
+    if (!CanEncode(written)) ConvertToUtf16Le();
+
+    if (const auto s = found; s != m_sectionIndex.end()) {
         Section& sec = m_sections[s->second];
         if (const auto k = sec.keys.find(Fold(keyName)); k != sec.keys.end()) {
             RewriteValue(*k->second, Quote(value));
@@ -255,7 +355,7 @@ bool VX_CIniDocument::SetValue(std::u16string_view section, std::u16string_view 
 }
 
 char16_t VX_CIniDocument::UnitAt(std::string_view bytes, size_t i) const {
-    if (m_encoding == Encoding::Utf8) return static_cast<unsigned char>(bytes[i]);
+    if (UnitBytes() == 1) return static_cast<unsigned char>(bytes[i]);
     const auto a = static_cast<unsigned char>(bytes[i]), b = static_cast<unsigned char>(bytes[i + 1]);
     return m_encoding == Encoding::Utf16Le ? static_cast<char16_t>(a | b << 8) : static_cast<char16_t>(b | a << 8);
 }
@@ -263,7 +363,7 @@ char16_t VX_CIniDocument::UnitAt(std::string_view bytes, size_t i) const {
 // Keeps the line's bytes up to the "=" and the blanks after it (the key as the
 // file spells it) and its line end; only the value between them changes.
 void VX_CIniDocument::RewriteValue(Line& line, std::u16string_view stored) {
-    const size_t unit = m_encoding == Encoding::Utf8 ? 1 : 2;
+    const size_t unit = UnitBytes();
     const size_t textBytes = (line.raw.size() - line.endBytes) / unit * unit;
     size_t pos = 0;
     while (pos < textBytes && UnitAt(line.raw, pos) != u'=') pos += unit;
@@ -288,7 +388,7 @@ VX_CIniDocument::LineIt VX_CIniDocument::InsertLine(LineIt before, std::u16strin
 void VX_CIniDocument::EnsureLastLineEnds() {
     if (m_lines.empty() || m_lines.back().endBytes > 0) return;
     Line& last = m_lines.back();
-    if (m_encoding != Encoding::Utf8 && last.raw.size() % 2 == 1) last.raw.pop_back();  // a stray odd byte
+    if (UnitBytes() == 2 && last.raw.size() % 2 == 1) last.raw.pop_back();  // a stray odd byte
     const std::string newline = NewLine();
     last.raw += newline;
     last.endBytes = newline.size();

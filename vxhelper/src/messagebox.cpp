@@ -2,6 +2,8 @@
 
 #include "platform/resources.h"
 
+#include "logwriter.h"
+
 #include <QApplication>
 #include <QMessageBox>
 #include <QThread>
@@ -11,8 +13,6 @@
 #include <mutex>
 
 namespace {
-
-std::atomic<VX_MessageLogWriter> g_logWriter{nullptr};
 
 std::mutex g_observerLock;  // guards g_observer and g_observerContext
 VX_MessageBoxObserver g_observer = nullptr;
@@ -47,7 +47,7 @@ int DefaultAnswer(UINT buttons) {
 int ShowHeadless(const CString& text, UINT type) {
     std::fprintf(stderr, "%s\n", text.ToUtf8().c_str());
     std::fflush(stderr);
-    if (VX_MessageLogWriter writer = g_logWriter.load()) writer(text);
+    VX_WriteErrorRecord(text);
     return DefaultAnswer(type & 0x0F);
 }
 
@@ -92,8 +92,6 @@ int VXHelper_MessageBox(HWND parent, const CString& text, UINT type) {
     Observe(parent, text, type);
     return CanShowWidgets() ? ShowWidget(parent, text, type) : ShowHeadless(text, type);
 }
-
-void VXHelper_SetMessageLogWriter(VX_MessageLogWriter writer) { g_logWriter.store(writer); }
 
 void VXHelper_SetMessageBoxObserver(VX_MessageBoxObserver observer, void* context) {
     std::lock_guard<std::mutex> guard(g_observerLock);

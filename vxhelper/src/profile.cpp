@@ -1,6 +1,9 @@
 #include "vxhelper/profile.h"
 
+#include "logwriter.h"
+
 #include "vxhelper/IniDocument.h"
+
 
 #include <algorithm>
 #include <atomic>
@@ -11,6 +14,7 @@
 #include <mutex>
 #include <optional>
 #include <string>
+#include <utility>
 
 #include <fcntl.h>
 #include <sys/stat.h>
@@ -23,8 +27,9 @@ constexpr off_t kMaxFileBytes = 16 * 1024 * 1024;
 // One file as the profile functions see it.
 struct ProfileFile {
     VX_CIniDocument doc;
-    bool writable = true;  // false when the file exists but could not be read
-    bool dirty = false;    // a session holds writes not yet saved
+    bool writable = true;    // false when the file exists but could not be read
+    bool dirty = false;      // a session holds writes not yet saved
+    bool reencoded = false;  // those writes turned a Windows-1252 file into UTF-16LE
     int sessions = 0;
 };
 
@@ -32,6 +37,13 @@ std::mutex g_lock;                            // guards g_sessions; serialises e
 std::map<std::string, ProfileFile> g_sessions;  // path -> file held by open sessions
 
 std::string PathOf(LPCWSTR path) { return path ? Utf16ToUtf8(path) : std::string(); }
+
+// Called with no lock of this file held.
+void LogReencoded(const std::string& path) {
+    VX_WriteInfoRecord(CString::FromUtf8("The settings file " + path +
+                                         " was rewritten as UTF-16LE with a byte-order mark: a value written to it "
+                                         "does not fit its Windows-1252 code page"));
+}
 
 // Reads a file; a missing file reads as empty and writable, anything that is
 // not a readable regular file of sensible size as empty and not writable.
@@ -179,15 +191,22 @@ bool VX_WritePrivateProfileInt(LPCWSTR section, LPCWSTR key, int value, LPCWSTR 
 
 bool VX_WritePrivateProfileString(LPCWSTR section, LPCWSTR key, LPCWSTR value, LPCWSTR path) {
     if (!section || !key || !value || !path) return false;
-    return WithFile(PathOf(path), [&](ProfileFile& file, bool inSession) {
+    bool reencoded = false;
+    const bool ok = WithFile(PathOf(path), [&](ProfileFile& file, bool inSession) {
         if (!file.writable) return false;
+        const auto encoding = file.doc.GetEncoding();
+        if (!file.doc.SetValue(section, key, value)) return false;
+        const bool changed = file.doc.GetEncoding() != encoding;
         if (inSession) {
-            if (!file.doc.SetValue(section, key, value)) return false;
             file.dirty = true;
+            file.reencoded = file.reencoded || changed;
             return true;
         }
-        return file.doc.SetValue(section, key, value) && Save(PathOf(path), file.doc.Serialize());
+        reencoded = changed;
+        return Save(PathOf(path), file.doc.Serialize());
     });
+    if (ok && reencoded) LogReencoded(PathOf(path));
+    return ok;
 }
 
 bool VX_GetPrivateProfileKeyNames(LPCWSTR section, CStringArray& keys, LPCWSTR path) {
@@ -216,20 +235,38 @@ VX_CPrivateProfileSession::~VX_CPrivateProfileSession() {
     if (it != g_sessions.end() && --it->second.sessions == 0) g_sessions.erase(it);
 }
 
+namespace {
+
+// Drops a session's pending changes: it reads the file as it is now.
+void Reload(const std::string& path, ProfileFile& file) {
+    const int sessions = file.sessions;
+    file = Load(path);
+    file.sessions = sessions;
+}
+
+}  // namespace
+
 bool VX_CPrivateProfileSession::Commit() {
-    std::lock_guard lock(g_lock);
-    auto it = g_sessions.find(m_path);
-    if (it == g_sessions.end() || !it->second.dirty) return true;
-    if (!it->second.writable || !Save(m_path, it->second.doc.Serialize())) return false;
-    it->second.dirty = false;
+    bool reencoded = false;
+    {
+        std::lock_guard lock(g_lock);
+        auto it = g_sessions.find(m_path);
+        if (it == g_sessions.end() || !it->second.dirty) return true;
+        if (!it->second.writable || !Save(m_path, it->second.doc.Serialize())) {
+            // A commit that failed never writes later (the session's end would retry
+            // it): a caller told that nothing was written must find the file unchanged.
+            Reload(m_path, it->second);
+            return false;
+        }
+        it->second.dirty = false;
+        reencoded = std::exchange(it->second.reencoded, false);
+    }
+    if (reencoded) LogReencoded(m_path);
     return true;
 }
 
 void VX_CPrivateProfileSession::Discard() {
     std::lock_guard lock(g_lock);
     auto it = g_sessions.find(m_path);
-    if (it == g_sessions.end()) return;
-    const int sessions = it->second.sessions;
-    it->second = Load(m_path);
-    it->second.sessions = sessions;
+    if (it != g_sessions.end()) Reload(m_path, it->second);
 }

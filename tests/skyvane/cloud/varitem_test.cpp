@@ -105,18 +105,30 @@ TEST_F(VarItemTest, TimeStamps) {
     EXPECT_EQ(data.m_time, 0);
     EXPECT_EQ(data.m_wMilliseconds, 250);
 
-    // Rejected times: value and status are stored, the time is not, no change is reported.
+    // A rejected time stores nothing: the item stays exactly as it was, and no change is reported.
     ASSERT_TRUE(Report(3.0, 0, 0, At(kMarch31_2024, 0, 0, 1, 5)));
+    const CVarItemRtData before(data);
     double value = 4.0;
     const DATE rejectedTimes[] = {At(18415.0, 12, 0, 0), At(402134.0, 0, 0, 0), std::nan("")};  // 1950, 3001
     for (const DATE rejected : rejectedTimes) {
-        EXPECT_FALSE(Report(value, 7, 0, rejected));
-        EXPECT_EQ(data.m_dValue, value);
-        EXPECT_EQ(data.m_dwStatusLow, 7u);
-        EXPECT_EQ(data.m_time, 1711843201);
-        EXPECT_EQ(data.m_wMilliseconds, 5);
+        EXPECT_FALSE(Report(value, 7, 1, rejected));
+        VX_CVariant text(u"text");
+        EXPECT_FALSE(data.Update(&text, 0, 0, &rejected));
+        EXPECT_FALSE(data.Update(&text, 0, 0, nullptr));
+        EXPECT_EQ(data.m_dValue, before.m_dValue);
+        EXPECT_EQ(data.m_strValue, before.m_strValue);
+        EXPECT_EQ(data.m_bIsString, before.m_bIsString);
+        EXPECT_EQ(data.m_dwStatusLow, before.m_dwStatusLow);
+        EXPECT_EQ(data.m_dwStatusHigh, before.m_dwStatusHigh);
+        EXPECT_EQ(data.m_time, before.m_time);
+        EXPECT_EQ(data.m_wMilliseconds, before.m_wMilliseconds);
         value += 1.0;
     }
+    CVarItemRtData first;  // a first value with a rejected time leaves the item without a value
+    VX_CVariant number(1.5);
+    EXPECT_FALSE(first.Update(&number, 0, 0, &rejectedTimes[0]));
+    EXPECT_FALSE(first.m_bValid);
+    EXPECT_EQ(first.m_dValue, 0.0);
     EXPECT_TRUE(Report(value, 0, 0, At(kMarch31_2024, 0, 0, 2)));  // the values that follow keep flowing
     EXPECT_EQ(data.m_time, 1711843202);
 }

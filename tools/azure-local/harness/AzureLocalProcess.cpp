@@ -165,8 +165,8 @@ bool AzureLocalProcess::Control(const std::string& method, const std::string& pa
 
 bool AzureLocalProcess::Fault(const std::string& query) { return Control("POST", "/_control/fault?" + query); }
 bool AzureLocalProcess::Reset() { return Control("POST", "/_control/reset"); }
-bool AzureLocalProcess::SetLimit(std::size_t bytes) {
-    return Control("POST", "/_control/limit?bytes=" + std::to_string(bytes));
+bool AzureLocalProcess::SetLimit(std::size_t bytes, const std::string& kind) {
+    return Control("POST", "/_control/limit?bytes=" + std::to_string(bytes) + (kind.empty() ? "" : "&kind=" + kind));
 }
 
 ServerStats AzureLocalProcess::Stats() {

@@ -42,7 +42,8 @@ public:
 
     bool Fault(const std::string& query);  // e.g. "kind=status&status=503&count=2&retry-after=1"
     bool Reset();
-    bool SetLimit(std::size_t bytes);
+    // Largest body accepted; kind "service-bus" or "event-hub" sets one of them, empty both.
+    bool SetLimit(std::size_t bytes, const std::string& kind = "");
     ServerStats Stats();
     std::vector<ReceivedRow> Rows();
 

@@ -240,10 +240,8 @@ void Server::Handle(QTcpSocket* socket, const HttpRequest& request) {
         return;
     }
     ++m_counters.requests;
-    if (!m_faults.empty()) {
-        Fault fault = m_faults.front();
-        if (--m_faults.front().remaining <= 0) m_faults.pop_front();
-        switch (fault.kind) {
+    if (const auto fault = TakeFault(request)) {
+        switch (fault->kind) {
             case Fault::Kind::Stall:
                 m_states[socket].stalled = true;
                 return;
@@ -252,21 +250,51 @@ void Server::Handle(QTcpSocket* socket, const HttpRequest& request) {
                 socket->abort();
                 return;
             case Fault::Kind::Status:
-            case Fault::Kind::EchoAuthorization: {
+            case Fault::Kind::EchoAuthorization:
+            case Fault::Kind::EchoSignature:
                 ++m_counters.rejected;
-                HttpReply reply = ErrorReply(fault.status, fault.kind == Fault::Kind::Status
-                                                               ? "injected fault"
-                                                               : "token " + request.headers.value("authorization"));
-                if (!fault.retryAfter.isEmpty()) reply.headers.append(qMakePair(QByteArray("Retry-After"), QByteArray(fault.retryAfter)));
-                if (!fault.retryAfterMs.isEmpty()) reply.headers.append(qMakePair(QByteArray("retry-after-ms"), QByteArray(fault.retryAfterMs)));
-                Write(socket, reply, false);
+                Write(socket, FaultReply(*fault, request), false);
                 return;
-            }
         }
     }
     const HttpReply reply = HandleSend(request, path, query, authority);
     if (reply.status >= 300) ++m_counters.rejected;
     Write(socket, reply, false);
+}
+
+std::optional<Fault> Server::TakeFault(const HttpRequest& request) {
+    if (m_faults.empty()) return std::nullopt;
+    Fault& next = m_faults.front();
+    if (!next.match.isEmpty() && !request.body.contains(next.match)) return std::nullopt;
+    if (next.skip > 0) {
+        --next.skip;
+        return std::nullopt;
+    }
+    const Fault fault = next;
+    if (--next.remaining <= 0) m_faults.pop_front();
+    return fault;
+}
+
+HttpReply Server::FaultReply(const Fault& fault, const HttpRequest& request) const {
+    const QByteArray authorization = request.headers.value("authorization");
+    QByteArray detail = "injected fault";
+    if (fault.kind == Fault::Kind::EchoAuthorization) {
+        detail = "token " + authorization;
+    } else if (fault.kind == Fault::Kind::EchoSignature) {
+        QByteArray signature;
+        for (const QByteArray& part : authorization.mid(authorization.indexOf(' ') + 1).split('&'))
+            if (part.startsWith("sig=")) signature = QByteArray::fromPercentEncoding(part.mid(4));
+        QByteArray url = signature;
+        url.replace('+', '-').replace('/', '_');
+        while (url.endsWith('=')) url.chop(1);
+        detail = "the signature " + signature + " (" + url + ") of " + QByteArray::fromPercentEncoding(authorization) +
+                 " was checked with the key " + m_config.key.toUtf8();
+    }
+    HttpReply reply = ErrorReply(fault.status, detail);
+    if (!fault.retryAfter.isEmpty()) reply.headers.append(qMakePair(QByteArray("Retry-After"), fault.retryAfter));
+    if (!fault.retryAfterMs.isEmpty())
+        reply.headers.append(qMakePair(QByteArray("retry-after-ms"), fault.retryAfterMs));
+    return reply;
 }
 
 HttpReply Server::HandleSend(const HttpRequest& request, const QByteArray& path, const QByteArray& query,
@@ -341,8 +369,12 @@ HttpReply Server::HandleControl(const HttpRequest& request, const QByteArray& pa
     if (path == "/_control/limit") {
         bool ok = false;
         const qint64 bytes = q.queryItemValue("bytes").toLongLong(&ok);
-        if (!ok || bytes <= 0) return ErrorReply(400, "limit?bytes=N");
-        m_config.serviceBusLimit = m_config.eventHubLimit = bytes;
+        if (!ok || bytes <= 0) return ErrorReply(400, "limit?bytes=N[&kind=service-bus|event-hub]");
+        const QString kind = q.queryItemValue("kind");
+        if (kind.isEmpty() || kind == "service-bus") m_config.serviceBusLimit = bytes;
+        if (kind.isEmpty() || kind == "event-hub") m_config.eventHubLimit = bytes;
+        if (!kind.isEmpty() && kind != "service-bus" && kind != "event-hub")
+            return ErrorReply(400, "kind is service-bus or event-hub");
         return TextReply("text/plain", "limit set\n");
     }
     if (path == "/_control/fault") {
@@ -352,12 +384,16 @@ HttpReply Server::HandleControl(const HttpRequest& request, const QByteArray& pa
         else if (kind == "stall") fault.kind = Fault::Kind::Stall;
         else if (kind == "close") fault.kind = Fault::Kind::Close;
         else if (kind == "echo-auth") fault.kind = Fault::Kind::EchoAuthorization;
-        else return ErrorReply(400, "kind is status, stall, close or echo-auth");
+        else if (kind == "echo-signature") fault.kind = Fault::Kind::EchoSignature;
+        else return ErrorReply(400, "kind is status, stall, close, echo-auth or echo-signature");
         bool ok = true;
         if (q.hasQueryItem("status")) fault.status = q.queryItemValue("status").toInt(&ok);
         if (!ok || fault.status < 200 || fault.status > 599) return ErrorReply(400, "status is 200..599");
         if (q.hasQueryItem("count")) fault.remaining = q.queryItemValue("count").toInt(&ok);
         if (!ok || fault.remaining < 1) return ErrorReply(400, "count is a positive number");
+        if (q.hasQueryItem("at")) fault.skip = q.queryItemValue("at").toInt(&ok) - 1;
+        if (!ok || fault.skip < 0) return ErrorReply(400, "at is a positive number");
+        fault.match = q.queryItemValue("match", QUrl::FullyDecoded).toUtf8();
         fault.retryAfter = q.queryItemValue("retry-after").toUtf8();
         fault.retryAfterMs = q.queryItemValue("retry-after-ms").toUtf8();
         m_faults.push_back(fault);

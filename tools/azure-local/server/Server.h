@@ -15,6 +15,7 @@
 
 #include <cstdint>
 #include <deque>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -50,13 +51,18 @@ struct HttpReply {
     QByteArray body;
 };
 
-// An injected fault, used for the next `remaining` send requests.
+// An injected fault, used for the next `remaining` send requests it applies to.
 struct Fault {
-    enum class Kind { Status, Stall, Close, EchoAuthorization } kind = Kind::Status;
+    // EchoAuthorization quotes the Authorization header in the error text;
+    // EchoSignature quotes the token's signature decoded (plain base64 and
+    // base64url), the whole token decoded and the server's key.
+    enum class Kind { Status, Stall, Close, EchoAuthorization, EchoSignature } kind = Kind::Status;
     int status = 503;
     QByteArray retryAfter;    // seconds, sent as Retry-After
     QByteArray retryAfterMs;  // sent as retry-after-ms
     int remaining = 1;
+    int skip = 0;             // requests to let through first (at=N: the Nth request from now)
+    QByteArray match;         // applies only to requests whose body holds this text
 };
 
 class Server : public QObject {
@@ -80,6 +86,9 @@ private:
     HttpReply HandleSend(const HttpRequest& request, const QByteArray& path, const QByteArray& query,
                          const QByteArray& authority);
     HttpReply HandleControl(const HttpRequest& request, const QByteArray& path, const QByteArray& query);
+    // The fault that applies to this request, taken off the queue when used up.
+    std::optional<Fault> TakeFault(const HttpRequest& request);
+    HttpReply FaultReply(const Fault& fault, const HttpRequest& request) const;
     void Write(QTcpSocket* socket, const HttpReply& reply, bool close);
     void Record(const std::vector<std::string>& lines);
 

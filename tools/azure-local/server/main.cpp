@@ -18,8 +18,9 @@ int main(int argc, char** argv) {
     parser.setApplicationDescription(
         "Loopback receiver for the Azure Service Bus and Event Hubs send endpoints.\n"
         "Control: GET /_control/stats, GET /_control/rows, POST /_control/reset,\n"
-        "POST /_control/limit?bytes=N, POST /_control/fault?kind=status|stall|close|echo-auth"
-        "&status=N&count=N&retry-after=S&retry-after-ms=MS");
+        "POST /_control/limit?bytes=N[&kind=service-bus|event-hub],\n"
+        "POST /_control/fault?kind=status|stall|close|echo-auth|echo-signature"
+        "&status=N&count=N&at=N&match=TEXT&retry-after=S&retry-after-ms=MS");
     parser.addHelpOption();
     parser.addOptions({
         {"port", "Port to listen on (0: a free one).", "n", "0"},
@@ -28,6 +29,7 @@ int main(int argc, char** argv) {
         {"key", "Shared access key accepted.", "key", "azure-local-key"},
         {"entity", "An existing queue or Event Hub (repeatable; none: all exist).", "name"},
         {"max-message-bytes", "Largest body accepted for both kinds of target.", "n"},
+        {"event-hub-max-message-bytes", "Largest body accepted by Event Hubs (after --max-message-bytes).", "n"},
         {"record", "Append received rows as JSON lines to this file ('-': standard output).", "file"},
         {"keep-rows", "Rows kept for GET /_control/rows.", "n", "100000"},
         {"tls-cert", "Serve HTTPS with this PEM certificate.", "file"},
@@ -55,6 +57,14 @@ int main(int argc, char** argv) {
             return 2;
         }
         config.serviceBusLimit = config.eventHubLimit = limit;
+    }
+    if (parser.isSet("event-hub-max-message-bytes")) {
+        const qint64 limit = parser.value("event-hub-max-message-bytes").toLongLong(&ok);
+        if (!ok || limit <= 0) {
+            std::cerr << "azure-local: --event-hub-max-message-bytes must be a positive number\n";
+            return 2;
+        }
+        config.eventHubLimit = limit;
     }
     config.recordPath = parser.value("record");
     config.keepRows = parser.value("keep-rows").toULongLong(&ok);

@@ -3,9 +3,11 @@
 //
 // Every line keeps its original bytes, so that serialising a document gives
 // back the file byte for byte except for the lines a change touched. Section
-// and key names match ignoring letter case, and the first match wins. Lines
-// before the first section, lines without "=", comment lines (";") and
-// anything unreadable are kept and otherwise ignored.
+// and key names match ignoring letter case, and the first match wins. A line
+// is a section heading only with its closing "]"; one that begins with "["
+// without it reads as Windows reads it, as a key when it holds "=" ("[k=1")
+// and else not at all. Lines before the first section, lines without "=",
+// comment lines (";") and anything unreadable are kept and otherwise ignored.
 
 #include <cstddef>
 #include <list>
@@ -18,7 +20,8 @@
 class VX_CIniDocument {
 public:
     // How the file's characters are stored; a byte-order mark is kept as found.
-    enum class Encoding { Utf8, Utf16Le, Utf16Be };
+    // Windows1252 is the ANSI code page in which Windows writes a new file.
+    enum class Encoding { Utf8, Utf16Le, Utf16Be, Windows1252 };
 
     VX_CIniDocument() = default;
     // Copies rebuild their own index; moves keep it (list nodes move along).
@@ -28,7 +31,8 @@ public:
     VX_CIniDocument& operator=(VX_CIniDocument&&) noexcept = default;
 
     // Reads a file's bytes. UTF-8 (with or without BOM) and UTF-16 (LE with or
-    // without BOM, BE with BOM); CR LF or LF line ends. Never fails.
+    // without BOM, BE with BOM); a file without BOM that is not valid UTF-8 is
+    // Windows-1252 (all 256 byte values). CR LF or LF line ends. Never fails.
     static VX_CIniDocument Parse(std::string_view bytes);
     std::string Serialize() const;
 
@@ -48,7 +52,10 @@ public:
     // Sets the value of a key: an existing key line is rewritten in place,
     // a new key goes after the last non-blank line of its section, a new
     // section at the end of the file. False, and nothing changes, when a name
-    // or the value cannot be stored in a line (see IsValid...).
+    // or the value cannot be stored in a line (see IsValid...). A Windows-1252
+    // file stays so while what is written fits the code page; otherwise the
+    // whole document becomes UTF-16LE with a byte-order mark (GetEncoding
+    // tells), so no character is ever replaced.
     bool SetValue(std::u16string_view section, std::u16string_view key, std::u16string_view value);
 
     // A section name must be non-empty after trimming and hold no "]" and no
@@ -77,8 +84,11 @@ private:
 
     void Classify(Line& line) const;
     void BuildIndex();
+    std::size_t UnitBytes() const;                                     // bytes of one character unit
     char16_t UnitAt(std::string_view bytes, std::size_t offset) const;  // one character unit
+    bool CanEncode(std::u16string_view text) const;
     std::string Encode(std::u16string_view text) const;
+    void ConvertToUtf16Le();
     std::u16string Decode(std::string_view bytes) const;
     std::string NewLine() const;
     void EnsureLastLineEnds();

@@ -6,7 +6,7 @@
 // returns when the user closes it; other events, timers among them, are
 // delivered meanwhile. Without one (a headless host, or a call off the
 // application's thread) the text goes to standard error and, through the
-// registered writer, into the log as one error record, and the call returns
+// error-record writer (vxhelper/logwriter.h), into the log as one error record, and the call returns
 // at once with the box's default answer.
 
 #include "platform/text.h"
@@ -29,11 +29,6 @@ constexpr int IDNO = 7;
 // Shows the text of a string id of the loaded modules' string tables.
 int VXHelper_MessageBox(HWND parent, UINT stringId, UINT type);
 int VXHelper_MessageBox(HWND parent, const CString& text, UINT type);
-
-// The error-record writer of the headless form (the loading module's log);
-// null: standard error only. A module that sets it clears it before unloading.
-using VX_MessageLogWriter = void (*)(const CString& text);
-void VXHelper_SetMessageLogWriter(VX_MessageLogWriter writer);
 
 // Sees every box before it is shown, in both forms, on the calling thread;
 // for tests. The box is then shown as always. Null removes it.

@@ -7,8 +7,12 @@
 // - names and values are read with surrounding blanks removed, and a value
 //   enclosed in a pair of quotes ("..." or '...') loses them;
 // - a missing file, section or key reads as the default;
-// - files may be UTF-8 (with or without BOM) or UTF-16 with BOM, with CR LF or
-//   LF line ends; a write keeps the file's encoding and line ends;
+// - files may be UTF-8 (with or without BOM), UTF-16 with BOM, or, without
+//   BOM and not valid UTF-8, Windows-1252, with CR LF or LF line ends; a
+//   write keeps the file's encoding and line ends, except that a Windows-1252
+//   file that must take a character beyond its code page becomes UTF-16LE
+//   with BOM (one information record in the central log says so);
+// - a line is a section heading only with its closing "]";
 // - a write changes only the line of its key (or adds one: a new key after the
 //   last non-blank line of its section, a new section at the end of the file)
 //   and replaces the file atomically: a temporary file beside it is written,
@@ -62,8 +66,9 @@ public:
     VX_CPrivateProfileSession& operator=(const VX_CPrivateProfileSession&) = delete;
 
     // Writes pending changes to the file. True when nothing was pending or
-    // the file was replaced; false when it could not be (the changes stay
-    // pending for a later Commit).
+    // the file was replaced; false when it could not be: then the changes are
+    // dropped (as by Discard), so the file stays as it was, also when the
+    // session ends.
     bool Commit();
     // Drops pending changes: the session reads the file as it is now.
     void Discard();

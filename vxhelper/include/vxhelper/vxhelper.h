@@ -3,6 +3,7 @@
 
 #include "vxhelper/aescrypt.h"
 #include "vxhelper/dirmanager.h"
+#include "vxhelper/logwriter.h"
 #include "vxhelper/messagebox.h"
 #include "vxhelper/profile.h"
 #include "vxhelper/thread.h"
