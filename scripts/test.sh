@@ -11,3 +11,7 @@ case "$flavour" in
 esac
 cd "$build"
 ctest --output-on-failure -j2
+if [[ "$flavour" == release ]]; then
+  # The demo as a smoke step: the whole road from the README's first command, shortened.
+  bash "$top/scripts/demo.sh" --duration 5
+fi
