@@ -107,6 +107,9 @@ CGateway::~CGateway() {
 void CGateway::AttachRuntimeSource() {
     LocalSocketOptions options;  // the folder: $SKYVANE_AUTOMATION_DIR, else the user's runtime folder
     options.log = [](const std::string& text) { GatewayError("runtime connection: " + text); };
+    // From a transport thread: only a post, which is safe from any thread and
+    // does nothing once the window is gone.
+    options.lost = [window = m_window.GetSafeHwnd()] { ::PostMessage(window, WM_GATEWAY_RUNTIME_LOST); };
     m_dwRuntimeSource = AddRunningObjectSource(CreateLocalSocketSource(options));
 }
 
@@ -223,6 +226,16 @@ void CGateway::OnReloadDone() {
         m_bReloadAgain = false;
         Reload();
     }
+}
+
+void CGateway::OnRuntimeLost() {
+    if (m_bStopping || !m_bRunning) return;
+    // The module's link now fails every call and nothing in it would ever
+    // subscribe again: start it afresh once a runtime is there.
+    GatewaySay("the SCADA runtime went away; the module stops and waits for it");
+    StopModule();
+    m_backoff.Reset();
+    ScheduleAttempt("runtime lost");
 }
 
 void CGateway::OnCycle(WPARAM rows, LPARAM durationMs) {

@@ -56,6 +56,8 @@ public:
     void OnFailedCycle() override { m_status.OnFailedCycle(); }
     void OnRestartFailed() override;
     void OnReloadDone() override;
+    // The runtime in another process went away: stop the module and wait for a runtime again.
+    void OnRuntimeLost() override;
 
 private:
     bool StartRuntime();

@@ -12,6 +12,8 @@ constexpr UINT WM_SKYVANE_STARTING = WM_USER + 103;        // 1127: init has beg
 // The gateway's own: posted after exec_action returns, so that it arrives
 // after any 1126 the module posted during the call.
 constexpr UINT WM_GATEWAY_RELOAD_DONE = WM_USER + 200;
+// The gateway's own: the connection to a runtime in another process was lost.
+constexpr UINT WM_GATEWAY_RUNTIME_LOST = WM_USER + 201;
 
 // What the window hands on; called on the window's (main) thread.
 class IHostMessages {
@@ -22,6 +24,7 @@ public:
     virtual void OnFailedCycle() = 0;
     virtual void OnRestartFailed() = 0;
     virtual void OnReloadDone() = 0;
+    virtual void OnRuntimeLost() = 0;
 };
 
 class CHostWindow : public CWnd {

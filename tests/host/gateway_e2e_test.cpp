@@ -161,22 +161,31 @@ TEST_F(GatewayEndToEnd, StartedBeforeTheRuntimeItKeepsTryingAndThenSends) {
     EXPECT_GT(RowsPerEntity()["values"], 0u);
 }
 
-TEST_F(GatewayEndToEnd, AttachesToARuntimeInAnotherProcessThatStartsLater) {
+TEST_F(GatewayEndToEnd, FollowsARuntimeInAnotherProcessThatStartsLaterAndIsKilled) {
     const std::string sockets = m_folder.Path("sockets");
     m_environment.insert("SKYVANE_AUTOMATION_DIR", QString::fromStdString(sockets));
     GatewayProcess gateway({"run", "--ini", WriteSettings({{"values", false, 1}}), "--status-interval", "0.5"},
                            m_environment);
     ASSERT_NE(gateway.WaitForText("start attempt 1 failed: no SCADA runtime is reachable"), "") << gateway.Errors();
+    const auto runs = [](const std::string& line) {
+        return line.find("start attempt") != std::string::npos && line.find("the module runs") != std::string::npos;
+    };
     RuntimeProcess runtime;
     ASSERT_TRUE(runtime.Start(Project(), sockets));
-    EXPECT_NE(gateway.WaitForLine([](const std::string& line) {
-                  return line.find("start attempt") != std::string::npos && line.find("the module runs") != std::string::npos;
-              }),
-              "");
+    EXPECT_NE(gateway.WaitForLine(runs), "");
+    ASSERT_NE(gateway.WaitForLine(IsStatusWithRows), "");
+
+    // Killed while values flow: the gateway keeps running, says so, and
+    // sends again once a new runtime is there.
+    runtime.Kill(SIGKILL);
+    ASSERT_NE(gateway.WaitForText("the SCADA runtime went away"), "") << gateway.Errors();
+    ASSERT_TRUE(runtime.Start(Project(), sockets));
+    EXPECT_NE(gateway.WaitForLine(runs, 45000), "");
+    const size_t before = RowsPerEntity()["values"];
     ASSERT_NE(gateway.WaitForLine(IsStatusWithRows), "");
     EXPECT_GE(StopWith(gateway, SIGTERM), 0);
     EXPECT_TRUE(runtime.Stop());
-    EXPECT_GT(RowsPerEntity()["values"], 0u);
+    EXPECT_GT(RowsPerEntity()["values"], before);
 }
 
 }  // namespace

@@ -34,6 +34,10 @@ struct LocalSocketOptions {
     DWORD frameTimeoutMs = 5000;  // longest wait for the rest of a frame once it has begun
     // Where refused clients, malformed frames and lost connections are reported; may be empty.
     std::function<void(const std::string&)> log;
+    // Called when a connection is lost (the peer went away or sent garbage),
+    // not when this side closed it; on a thread of the transport, with no lock
+    // of it held. May be empty.
+    std::function<void()> lost;
 };
 
 // The folder the options name (not created, not checked).

@@ -59,7 +59,9 @@ void CChannel::Broken(const std::string& reason) {
     m_replied.notify_all();
     m_work.notify_all();
     ::shutdown(m_fd, SHUT_RDWR);  // wakes the reader
-    if (!reason.empty()) Log(reason);
+    if (reason.empty()) return;
+    Log(reason);
+    if (m_options.lost) m_options.lost();
 }
 
 void CChannel::Close() {
