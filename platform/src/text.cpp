@@ -49,40 +49,60 @@ char16_t FoldCase(char16_t c) {
 
 }  // namespace
 
+namespace {
+
+// One UTF-8 sequence starting at in[i]. A valid one gives its code point and
+// length; a broken one (bad lead byte, cut short, overlong, surrogate, beyond
+// U+10FFFF) gives how many bytes to skip so that decoding resumes at the next
+// byte that could start a character.
+struct Utf8Step {
+    bool valid;
+    size_t length;
+    char32_t cp;
+};
+
+Utf8Step DecodeUtf8At(std::string_view in, size_t i) {
+    const auto b0 = static_cast<unsigned char>(in[i]);
+    if (b0 < 0x80) return {true, 1, b0};
+    int extra = 0;
+    char32_t cp = 0, min = 0;
+    if ((b0 & 0xE0) == 0xC0) { extra = 1; cp = b0 & 0x1F; min = 0x80; }
+    else if ((b0 & 0xF0) == 0xE0) { extra = 2; cp = b0 & 0x0F; min = 0x800; }
+    else if ((b0 & 0xF8) == 0xF0) { extra = 3; cp = b0 & 0x07; min = 0x10000; }
+    else return {false, 1, 0};
+    size_t j = 1;
+    for (; j <= static_cast<size_t>(extra) && i + j < in.size(); ++j) {
+        const auto b = static_cast<unsigned char>(in[i + j]);
+        if ((b & 0xC0) != 0x80) break;
+        cp = (cp << 6) | (b & 0x3F);
+    }
+    if (j <= static_cast<size_t>(extra) || cp < min || cp > 0x10FFFF || (cp >= 0xD800 && cp <= 0xDFFF)) {
+        return {false, std::max<size_t>(1, j), 0};
+    }
+    return {true, j, cp};
+}
+
+}  // namespace
+
 std::u16string Utf8ToUtf16(std::string_view in) {
     std::u16string out;
     out.reserve(in.size());
-    size_t i = 0;
-    while (i < in.size()) {
-        const auto b0 = static_cast<unsigned char>(in[i]);
-        if (b0 < 0x80) {
-            out += static_cast<char16_t>(b0);
-            ++i;
-            continue;
-        }
-        int extra = 0;
-        char32_t cp = 0, min = 0;
-        if ((b0 & 0xE0) == 0xC0) { extra = 1; cp = b0 & 0x1F; min = 0x80; }
-        else if ((b0 & 0xF0) == 0xE0) { extra = 2; cp = b0 & 0x0F; min = 0x800; }
-        else if ((b0 & 0xF8) == 0xF0) { extra = 3; cp = b0 & 0x07; min = 0x10000; }
-        else { out += kReplacement; ++i; continue; }
-        size_t j = 1;
-        for (; j <= static_cast<size_t>(extra) && i + j < in.size(); ++j) {
-            const auto b = static_cast<unsigned char>(in[i + j]);
-            if ((b & 0xC0) != 0x80) break;
-            cp = (cp << 6) | (b & 0x3F);
-        }
-        if (j <= static_cast<size_t>(extra) || cp < min || cp > 0x10FFFF || (cp >= 0xD800 && cp <= 0xDFFF)) {
-            // A broken sequence costs one replacement and resumes at the next byte
-            // that could start a character.
-            out += kReplacement;
-            i += std::max<size_t>(1, j);
-            continue;
-        }
-        AppendUtf16(out, cp);
-        i += j;
+    for (size_t i = 0; i < in.size();) {
+        const Utf8Step step = DecodeUtf8At(in, i);
+        if (step.valid) AppendUtf16(out, step.cp);
+        else out += kReplacement;  // a broken sequence costs one replacement
+        i += step.length;
     }
     return out;
+}
+
+bool IsValidUtf8(std::string_view bytes) {
+    for (size_t i = 0; i < bytes.size();) {
+        const Utf8Step step = DecodeUtf8At(bytes, i);
+        if (!step.valid) return false;
+        i += step.length;
+    }
+    return true;
 }
 
 std::string Utf16ToUtf8(std::u16string_view in) {

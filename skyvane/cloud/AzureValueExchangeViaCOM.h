@@ -35,8 +35,6 @@ public:
     void OnProjectActiveFailed(const CString& strProject) override;
     void OnValueQueueFull(CString strProject, DWORD dwId) override;
 
-    CMultipleOnlVarsPerPrj* GetLink() const { return m_pLink.Get(); }
-
 private:
     VX_KeepRefCmdPtr<CMultipleOnlVarsPerPrj> m_pLink;  // window thread only
     IMainAzureAccess* m_pMain;                          // not owned

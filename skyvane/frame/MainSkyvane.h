@@ -56,12 +56,6 @@ public:
 
     LRESULT WindowProc(UINT message, WPARAM wParam, LPARAM lParam) override;
 
-    // For tests and the host: state that is otherwise internal.
-    const CAzureConfig& GetSettings() const { return m_config; }
-    int GetQueueLimit() const { return m_nQueueLimit; }
-    int GetQueuedCount() const { return m_nQueued.load(std::memory_order_relaxed); }
-    CAzureValueExchangeViaCOM* GetBridge() const { return m_pBridge.get(); }
-
 private:
     struct RowCounts {
         int succeeded = 0;

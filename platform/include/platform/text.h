@@ -15,6 +15,8 @@
 // becomes U+FFFD, so any text converts without failing.
 std::u16string Utf8ToUtf16(std::string_view utf8);
 std::string Utf16ToUtf8(std::u16string_view utf16);
+// Strict UTF-8: no broken or overlong sequences, no surrogates, nothing beyond U+10FFFF.
+bool IsValidUtf8(std::string_view bytes);
 
 // One argument of CString::Format, captured with its real type so that a
 // conversion never reads an argument as something it is not.
