@@ -266,7 +266,13 @@ CComVariant EventBuilder::Array(std::vector<std::optional<double>>& numbers, std
     CComVariant holder;
     holder.vt = VT_ARRAY | vt;
     holder.parray = array;
-    return holder;
+    if (shape / 16 < 12) return holder;
+    // The array by reference: the runtime's own array, which the link must not keep.
+    m_pool.push_back(std::move(holder));
+    CComVariant reference;
+    reference.vt = VT_ARRAY | VT_BYREF | vt;
+    reference.pparray = &m_pool.back().parray;
+    return reference;
 }
 
 bool Low32(const std::optional<double>& number, DWORD* low) { return number && TruncatedLow32(*number, low); }
