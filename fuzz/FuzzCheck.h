@@ -22,7 +22,6 @@ class FuzzBytes {
 public:
     FuzzBytes(const std::uint8_t* data, std::size_t size) : m_data(data), m_size(size) {}
 
-    bool Empty() const { return m_pos >= m_size; }
     std::uint8_t Byte() { return m_pos < m_size ? m_data[m_pos++] : 0; }
     bool Flag() { return Byte() & 1; }
     template <typename T>
@@ -33,20 +32,20 @@ public:
         std::memcpy(&value, raw, sizeof value);
         return value;
     }
-    // Up to max bytes as text.
+    // Up to max bytes as text (the length comes first).
     std::string_view Text(std::size_t max) {
-        const std::size_t n = std::min<std::size_t>(Byte() % (max + 1), m_size - std::min(m_pos, m_size));
-        const std::string_view text(reinterpret_cast<const char*>(m_data) + m_pos, n);
-        m_pos += n;
-        return text;
+        const std::size_t wanted = Byte() % (max + 1);  // read before what is left is counted
+        return Take(std::min(wanted, m_size - m_pos));
     }
-    std::string_view Rest() {
-        const std::string_view rest = m_pos < m_size ? std::string_view(reinterpret_cast<const char*>(m_data) + m_pos, m_size - m_pos) : std::string_view();
-        m_pos = m_size;
-        return rest;
-    }
+    std::string_view Rest() { return Take(m_size - m_pos); }
 
 private:
+    std::string_view Take(std::size_t n) {
+        const std::string_view taken(reinterpret_cast<const char*>(m_data) + m_pos, n);
+        m_pos += n;
+        return taken;
+    }
+
     const std::uint8_t* m_data;
     std::size_t m_size;
     std::size_t m_pos = 0;
