@@ -7,6 +7,8 @@
 #include "vxhelper/IniDocument.h"
 #include "vxhelper/profile.h"
 
+#include "FuzzCheck.h"
+
 #include <cstdint>
 #include <cstdio>
 #include <cstdlib>
@@ -17,13 +19,6 @@
 #include <vector>
 
 namespace {
-
-void Check(bool condition, const char* what) {
-    if (!condition) {
-        std::fprintf(stderr, "ini_fuzz: %s\n", what);
-        std::abort();
-    }
-}
 
 const std::string& ScratchFile() {
     // In memory where possible: rewriting a file on disk thousands of times a second is slow.
@@ -40,22 +35,22 @@ const std::string& ScratchFile() {
 
 void CheckDocument(std::string_view bytes) {
     VX_CIniDocument doc = VX_CIniDocument::Parse(bytes);
-    Check(doc.Serialize() == bytes, "an unchanged document must serialise to its input");
+    FuzzCheck(doc.Serialize() == bytes, "an unchanged document must serialise to its input");
 
     // Every key name the document lists must be found again.
     for (const char16_t* section : {u"Azure", u"VARIABLES", u"CONNECTIONS", u"s"}) {
         for (const std::u16string& key : doc.GetKeyNames(section))
-            Check(doc.GetValue(section, key).has_value(), "a listed key must be found");
+            FuzzCheck(doc.GetValue(section, key).has_value(), "a listed key must be found");
     }
 
     // A write reads back, also after serialising and parsing again.
     const std::u16string value = u" padded \"quoted\" ";
-    Check(doc.SetValue(u"Azure", u"PROXY_PWD", value), "a valid write must be accepted");
-    Check(doc.GetValue(u"azure", u"proxy_pwd") == value, "a write must read back");
-    Check(doc.SetValue(u"New Section", u"k", u"'x'"), "a valid write must be accepted");
+    FuzzCheck(doc.SetValue(u"Azure", u"PROXY_PWD", value), "a valid write must be accepted");
+    FuzzCheck(doc.GetValue(u"azure", u"proxy_pwd") == value, "a write must read back");
+    FuzzCheck(doc.SetValue(u"New Section", u"k", u"'x'"), "a valid write must be accepted");
     const VX_CIniDocument again = VX_CIniDocument::Parse(doc.Serialize());
-    Check(again.GetValue(u"AZURE", u"PROXY_PWD") == value, "a write must survive serialising");
-    Check(again.GetValue(u"new section", u"K") == u"'x'", "a new section must survive serialising");
+    FuzzCheck(again.GetValue(u"AZURE", u"PROXY_PWD") == value, "a write must survive serialising");
+    FuzzCheck(again.GetValue(u"new section", u"K") == u"'x'", "a new section must survive serialising");
 }
 
 void CheckReencoding(std::string_view bytes) {
@@ -67,15 +62,15 @@ void CheckReencoding(std::string_view bytes) {
             values.emplace_back(section, key, doc.GetValue(section, key));
     }
     const std::u16string wide = u"Linie#\u6e29\u5ea6 \u20ac";
-    Check(doc.SetValue(u"VARIABLES", u"NAME_\u4e2d", wide), "a valid write must be accepted");
+    FuzzCheck(doc.SetValue(u"VARIABLES", u"NAME_\u4e2d", wide), "a valid write must be accepted");
     if (ansi) {
-        Check(doc.GetEncoding() == VX_CIniDocument::Encoding::Utf16Le,
+        FuzzCheck(doc.GetEncoding() == VX_CIniDocument::Encoding::Utf16Le,
               "a character beyond the code page must give UTF-16LE");
     }
     const VX_CIniDocument again = VX_CIniDocument::Parse(doc.Serialize());
-    Check(again.GetValue(u"variables", u"name_\u4e2d") == wide, "a write beyond the code page must read back");
+    FuzzCheck(again.GetValue(u"variables", u"name_\u4e2d") == wide, "a write beyond the code page must read back");
     for (const auto& [section, key, value] : values)
-        Check(again.GetValue(section, key) == value, "a change of encoding must keep every value");
+        FuzzCheck(again.GetValue(section, key) == value, "a change of encoding must keep every value");
 }
 
 void CheckProfileFunctions(std::string_view bytes) {
@@ -90,7 +85,7 @@ void CheckProfileFunctions(std::string_view bytes) {
     for (const char16_t* key : {u"COUNT", u"INTEGRITYPERIOD", u"NAME_0"}) {
         VX_GetPrivateProfileInt(u"VARIABLES", key, 5, file);
         const DWORD n = VX_GetPrivateProfileString(u"Azure", key, u"default", buffer, 16, file);
-        Check(n < 16 && buffer[n] == 0, "text must be cut to the buffer and terminated");
+        FuzzCheck(n < 16 && buffer[n] == 0, "text must be cut to the buffer and terminated");
     }
     CStringArray keys;
     VX_GetPrivateProfileKeyNames(u"CONNECTIONS", keys, file);

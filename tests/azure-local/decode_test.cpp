@@ -4,6 +4,7 @@
 #include <gtest/gtest.h>
 
 #include <cmath>
+#include <limits>
 #include <string>
 
 #include "RowDecoders.h"
@@ -153,4 +154,38 @@ TEST(RecordLines, RoundTrip) {
     EXPECT_EQ(entity, "queue");
     EXPECT_EQ(id, "id-1");
     EXPECT_FALSE(RowFromJsonLine("not json"));
+}
+
+TEST(RecordLines, KeepEverySixtyFourBitTime) {
+    // A Bond body carries any 64-bit time; a line must not round it (nor
+    // overflow converting it back).
+    for (const std::int64_t time : {std::int64_t{9007199254740993}, std::numeric_limits<std::int64_t>::max(),
+                                    std::numeric_limits<std::int64_t>::min(), std::int64_t{-1}}) {
+        DecodedRow row;
+        row.time = time;
+        const auto back = RowFromJsonLine(RowToJsonLine(row, "q", "BOND", "m"));
+        ASSERT_TRUE(back);
+        EXPECT_EQ(back->time, time);
+    }
+}
+
+TEST(IsoTimes, OnlyTheExactFormIsRead) {
+    std::int64_t seconds = 0;
+    unsigned ms = 0;
+    ASSERT_TRUE(ParseIsoTime("2023-11-14T22:13:20.042Z", seconds, ms));
+    EXPECT_EQ(seconds, 1700000000);
+    EXPECT_EQ(ms, 42u);
+    ASSERT_TRUE(ParseIsoTime("0000-01-01T00:00:00.000Z", seconds, ms));
+    EXPECT_EQ(seconds, -62167219200);
+    // Each has the right length, but a sign, a blank or a short field: no
+    // sender writes them, and a five-digit year cannot be written back.
+    for (const char* text : {"19993-2-11T23:59:59.999Z", "+024-01-01T00:00:00.000Z", "-001-01-01T00:00:00.000Z",
+                             " 024-01-01T00:00:00.000Z", "2024-01-01T 1:00:00.000Z", "2024-01-01T00:00:00.+12Z",
+                             "2024-01-01T00:00:00.000z", "2024-01-01T00:00:60.000Z", "2024-00-01T00:00:00.000Z"}) {
+        EXPECT_FALSE(ParseIsoTime(text, seconds, ms)) << text;
+    }
+    const auto xml = DecodeXmlRows("<rows><row project=\"p\" variable=\"v\" time=\"19993-2-11T23:59:59.999Z\" status=\"1\" "
+                                   "type=\"number\">1</row></rows>");
+    EXPECT_FALSE(xml.ok);
+    EXPECT_EQ(xml.error, "XML body: malformed time");
 }

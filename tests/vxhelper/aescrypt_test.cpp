@@ -49,6 +49,20 @@ TEST(AesCrypt, DamagedFormsAndOtherKeysAreDetected) {
     EXPECT_FALSE(CAesCrypt(kHigh, kLow ^ 1).DecryptHexString(other));
 }
 
+TEST(AesCrypt, TextsThatAreNotValidUtf16AreRefusedAndKept) {
+    const CAesCrypt crypt(kHigh, kLow);
+    // A lone surrogate has no UTF-8 form; enciphering it would give back U+FFFD.
+    for (const std::u16string& chars : {std::u16string(u"pass") + char16_t(0xD83D), std::u16string(1, char16_t(0xDC00)) + u"x"}) {
+        CString text(chars);
+        EXPECT_FALSE(crypt.EncryptHexString(text));
+        EXPECT_EQ(text.View(), chars);
+    }
+    CString pair = u"pass😀";  // a whole surrogate pair is fine
+    ASSERT_TRUE(crypt.EncryptHexString(pair));
+    ASSERT_TRUE(crypt.DecryptHexString(pair));
+    EXPECT_EQ(pair, CString(u"pass😀"));
+}
+
 TEST(AesCrypt, SecureClearStringOverwritesTheCharacters) {
     CString secret(std::u16string(64, u'S'));
     const char16_t* chars = secret.GetString();

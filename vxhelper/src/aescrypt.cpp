@@ -56,6 +56,11 @@ CAesCrypt::~CAesCrypt() { OPENSSL_cleanse(m_key, sizeof m_key); }
 bool CAesCrypt::EncryptHexString(CString& text) const {
     if (text.IsEmpty()) return true;
     std::string utf8 = text.ToUtf8();
+    // A lone surrogate has no UTF-8 form: it would come back as U+FFFD.
+    if (Utf8ToUtf16(utf8) != text.View()) {
+        OPENSSL_cleanse(utf8.data(), utf8.size());
+        return false;
+    }
     SecretBytes plain(utf8.size());
     std::copy(utf8.begin(), utf8.end(), plain.bytes.begin());
     OPENSSL_cleanse(utf8.data(), utf8.size());

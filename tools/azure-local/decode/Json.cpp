@@ -216,6 +216,13 @@ const JsonValue* JsonValue::Find(std::string_view name) const {
     return nullptr;
 }
 
+JsonValue::JsonValue() = default;
+JsonValue::JsonValue(const JsonValue&) = default;
+JsonValue::JsonValue(JsonValue&&) noexcept = default;
+JsonValue& JsonValue::operator=(const JsonValue&) = default;
+JsonValue& JsonValue::operator=(JsonValue&&) noexcept = default;
+JsonValue::~JsonValue() = default;
+
 std::optional<double> JsonValue::AsDouble() const {
     if (kind != Kind::Number) return std::nullopt;
     double value = 0;

@@ -19,6 +19,15 @@ struct JsonValue {
     std::vector<JsonValue> items;
     std::vector<std::pair<std::string, JsonValue>> members;
 
+    // Out of line, where JsonValue is complete: clang with libstdc++ refuses
+    // the implicit ones while a pair holding JsonValue is still incomplete.
+    JsonValue();
+    JsonValue(const JsonValue&);
+    JsonValue(JsonValue&&) noexcept;
+    JsonValue& operator=(const JsonValue&);
+    JsonValue& operator=(JsonValue&&) noexcept;
+    ~JsonValue();
+
     const JsonValue* Find(std::string_view name) const;
     std::optional<double> AsDouble() const;
     std::optional<std::uint64_t> AsUnsigned() const;

@@ -11,7 +11,6 @@
 #include <cctype>
 #include <charconv>
 #include <cmath>
-#include <cstdio>
 #include <cstring>
 #include <limits>
 
@@ -39,6 +38,14 @@ bool ParseDouble(std::string_view text, double& value) {
 bool ParseUnsigned(std::string_view text, std::uint64_t& value) {
     const auto [ptr, ec] = std::from_chars(text.data(), text.data() + text.size(), value);
     return !text.empty() && ec == std::errc() && ptr == text.data() + text.size();
+}
+
+bool ParseSigned(std::string_view text, std::int64_t& value) {
+    std::int64_t parsed = 0;
+    const auto [ptr, ec] = std::from_chars(text.data(), text.data() + text.size(), parsed);
+    if (text.empty() || ec != std::errc() || ptr != text.data() + text.size()) return false;
+    value = parsed;
+    return true;
 }
 
 DecodeResult Failure(std::string why) {
@@ -206,18 +213,24 @@ std::string Lower(std::string_view text) {
 }  // namespace
 
 bool ParseIsoTime(std::string_view text, std::int64_t& seconds, unsigned& milliseconds) {
-    int year = 0;
-    unsigned month = 0, day = 0, hour = 0, minute = 0, second = 0, ms = 0;
-    char z = 0;
-    int consumed = 0;
-    const std::string s(text);
-    if (std::sscanf(s.c_str(), "%5d-%2u-%2uT%2u:%2u:%2u.%3u%c%n", &year, &month, &day, &hour, &minute, &second, &ms,
-                    &z, &consumed) != 8 ||
-        z != 'Z' || static_cast<std::size_t>(consumed) != s.size() || s.size() != 24)
-        return false;
+    // Exactly this form, digits where the pattern has 'd': no signs, blanks or
+    // short fields, which a sender's time stamps never have.
+    constexpr std::string_view kPattern = "dddd-dd-ddTdd:dd:dd.dddZ";
+    if (text.size() != kPattern.size()) return false;
+    for (std::size_t i = 0; i < text.size(); ++i) {
+        const bool digit = text[i] >= '0' && text[i] <= '9';
+        if (kPattern[i] == 'd' ? !digit : text[i] != kPattern[i]) return false;
+    }
+    const auto field = [&](std::size_t at, std::size_t length) {
+        unsigned value = 0;
+        for (std::size_t i = at; i < at + length; ++i) value = value * 10 + static_cast<unsigned>(text[i] - '0');
+        return value;
+    };
+    const unsigned year = field(0, 4), month = field(5, 2), day = field(8, 2);
+    const unsigned hour = field(11, 2), minute = field(14, 2), second = field(17, 2);
     if (month < 1 || month > 12 || day < 1 || day > 31 || hour > 23 || minute > 59 || second > 59) return false;
     seconds = DaysFromCivil(year, month, day) * 86400 + hour * 3600 + minute * 60 + second;
-    milliseconds = ms;
+    milliseconds = field(20, 3);
     return true;
 }
 
@@ -386,7 +399,8 @@ std::optional<DecodedRow> RowFromJsonLine(std::string_view line, std::string* en
     } else if (value) {
         row.value = value->AsDouble().value_or(0);
     }
-    if (const JsonValue* v = document->Find("time")) row.time = static_cast<std::int64_t>(v->AsDouble().value_or(0));
+    // Read exactly: a Bond body carries any 64-bit time, which a double would round.
+    if (const JsonValue* v = document->Find("time"); v && v->kind == JsonValue::Kind::Number) ParseSigned(v->text, row.time);
     if (const JsonValue* v = document->Find("milliseconds")) row.milliseconds = static_cast<unsigned>(v->AsUnsigned().value_or(0));
     if (const JsonValue* v = document->Find("status")) row.status = v->AsUnsigned().value_or(0);
     if (entity) *entity = text("entity");

@@ -21,7 +21,8 @@ public:
     CAesCrypt& operator=(const CAesCrypt&) = delete;
 
     // Replaces text by the hexadecimal form of its encryption. False, and text
-    // unchanged, when that is not possible.
+    // unchanged, when that is not possible, also for a text that is not valid
+    // UTF-16 (a lone surrogate), which would not decrypt to itself.
     bool EncryptHexString(CString& text) const;
 
     // Replaces the hexadecimal form by the text it enciphers (either letter
