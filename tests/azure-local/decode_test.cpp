@@ -177,11 +177,14 @@ TEST(IsoTimes, OnlyTheExactFormIsRead) {
     EXPECT_EQ(ms, 42u);
     ASSERT_TRUE(ParseIsoTime("0000-01-01T00:00:00.000Z", seconds, ms));
     EXPECT_EQ(seconds, -62167219200);
+    ASSERT_TRUE(ParseIsoTime("2024-02-29T00:00:00.000Z", seconds, ms));  // a leap day
+    EXPECT_EQ(seconds, 1709164800);
     // Each has the right length, but a sign, a blank or a short field: no
     // sender writes them, and a five-digit year cannot be written back.
     for (const char* text : {"19993-2-11T23:59:59.999Z", "+024-01-01T00:00:00.000Z", "-001-01-01T00:00:00.000Z",
                              " 024-01-01T00:00:00.000Z", "2024-01-01T 1:00:00.000Z", "2024-01-01T00:00:00.+12Z",
-                             "2024-01-01T00:00:00.000z", "2024-01-01T00:00:60.000Z", "2024-00-01T00:00:00.000Z"}) {
+                             "2024-01-01T00:00:00.000z", "2024-01-01T00:00:60.000Z", "2024-00-01T00:00:00.000Z",
+                             "2023-02-29T00:00:00.000Z", "2024-04-31T00:00:00.000Z"}) {
         EXPECT_FALSE(ParseIsoTime(text, seconds, ms)) << text;
     }
     const auto xml = DecodeXmlRows("<rows><row project=\"p\" variable=\"v\" time=\"19993-2-11T23:59:59.999Z\" status=\"1\" "

@@ -2,6 +2,7 @@
 
 #include <cctype>
 #include <charconv>
+#include <chrono>
 #include <cmath>
 #include <cstdint>
 #include <string>
@@ -14,19 +15,6 @@ constexpr long long kDaysFrom1970To18991230 = -25569;
 // part of the earliest day is -657434, so anything above -657435 belongs to it.
 constexpr double kFirstDate = -657435.0;
 constexpr double kEndDate = 2958466.0;  // 10000-01-01
-
-// Calendar date of a day count since 1970-01-01 (proleptic Gregorian).
-void CivilFromDays(long long z, int& year, unsigned& month, unsigned& day) {
-    z += 719468;
-    const long long era = (z >= 0 ? z : z - 146096) / 146097;
-    const auto doe = static_cast<unsigned>(z - era * 146097);
-    const unsigned yoe = (doe - doe / 1460 + doe / 36524 - doe / 146096) / 365;
-    const unsigned doy = doe - (365 * yoe + yoe / 4 - yoe / 100);
-    const unsigned mp = (5 * doy + 2) / 153;
-    day = doy - (153 * mp + 2) / 5 + 1;
-    month = mp < 10 ? mp + 3 : mp - 9;
-    year = static_cast<int>(static_cast<long long>(yoe) + era * 400 + (month <= 2 ? 1 : 0));
-}
 
 // A by-value view of value: by-reference forms are read through, nested
 // VT_VARIANT references up to a small depth (a reference cycle must not loop).
@@ -108,15 +96,14 @@ bool ConvertDATE2Systemtime(DATE date, SYSTEMTIME* st) {
         ms -= static_cast<long long>(kMsPerDay);
         ++days;
     }
-    int year = 0;
-    unsigned month = 0, day = 0;
-    CivilFromDays(days + kDaysFrom1970To18991230, year, month, day);
+    const std::chrono::sys_days unixDay{std::chrono::days(days + kDaysFrom1970To18991230)};
+    const std::chrono::year_month_day calendar{unixDay};
+    const int year = static_cast<int>(calendar.year());
     if (year < 100 || year > 9999) return false;
-    const long long unixDays = days + kDaysFrom1970To18991230;
     st->wYear = static_cast<WORD>(year);
-    st->wMonth = static_cast<WORD>(month);
-    st->wDay = static_cast<WORD>(day);
-    st->wDayOfWeek = static_cast<WORD>(((unixDays % 7) + 7 + 4) % 7);  // 1970-01-01 was a Thursday
+    st->wMonth = static_cast<WORD>(static_cast<unsigned>(calendar.month()));
+    st->wDay = static_cast<WORD>(static_cast<unsigned>(calendar.day()));
+    st->wDayOfWeek = static_cast<WORD>(std::chrono::weekday(unixDay).c_encoding());  // 0 is Sunday
     st->wHour = static_cast<WORD>(ms / 3600000);
     st->wMinute = static_cast<WORD>(ms / 60000 % 60);
     st->wSecond = static_cast<WORD>(ms / 1000 % 60);

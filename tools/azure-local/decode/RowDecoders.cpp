@@ -10,6 +10,7 @@
 #include <algorithm>
 #include <cctype>
 #include <charconv>
+#include <chrono>
 #include <cmath>
 #include <cstring>
 #include <limits>
@@ -17,15 +18,6 @@
 namespace azurelocal {
 
 namespace {
-
-std::int64_t DaysFromCivil(std::int64_t y, unsigned m, unsigned d) {
-    y -= m <= 2;
-    const std::int64_t era = (y >= 0 ? y : y - 399) / 400;
-    const auto yoe = static_cast<unsigned>(y - era * 400);
-    const unsigned doy = (153 * (m + (m > 2 ? -3 : 9)) + 2) / 5 + d - 1;
-    const unsigned doe = yoe * 365 + yoe / 4 - yoe / 100 + doy;
-    return era * 146097 + static_cast<std::int64_t>(doe) - 719468;
-}
 
 bool ParseDouble(std::string_view text, double& value) {
     if (text == "NaN") return value = std::numeric_limits<double>::quiet_NaN(), true;
@@ -228,8 +220,11 @@ bool ParseIsoTime(std::string_view text, std::int64_t& seconds, unsigned& millis
     };
     const unsigned year = field(0, 4), month = field(5, 2), day = field(8, 2);
     const unsigned hour = field(11, 2), minute = field(14, 2), second = field(17, 2);
-    if (month < 1 || month > 12 || day < 1 || day > 31 || hour > 23 || minute > 59 || second > 59) return false;
-    seconds = DaysFromCivil(year, month, day) * 86400 + hour * 3600 + minute * 60 + second;
+    const std::chrono::year_month_day date{std::chrono::year(static_cast<int>(year)), std::chrono::month(month),
+                                           std::chrono::day(day)};
+    if (!date.ok() || hour > 23 || minute > 59 || second > 59) return false;  // also 30 February and the like
+    const auto days = std::chrono::sys_days(date).time_since_epoch().count();
+    seconds = static_cast<std::int64_t>(days) * 86400 + hour * 3600 + minute * 60 + second;
     milliseconds = field(20, 3);
     return true;
 }
