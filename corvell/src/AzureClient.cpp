@@ -35,6 +35,10 @@ std::string SignatureOf(const std::string& token) {
 
 }  // namespace
 
+std::int64_t ClientClock::UnixSeconds() { return std::time(nullptr); }
+
+void ClientClock::Sleep(milliseconds wait) { std::this_thread::sleep_for(wait); }
+
 struct AzureClient::Target {
     ConnectionString connection;
     std::string entity;
@@ -73,6 +77,7 @@ AzureClient::AzureClient(ILogger* logger, ProxySettings proxy, ClientOptions opt
       m_proxy(std::move(proxy)),
       m_options(std::move(options)),
       m_backoff(m_options.firstBackoff, m_options.maxBackoff) {
+    if (!m_options.clock) m_options.clock = std::make_shared<ClientClock>();
     m_log.AddSecret(m_proxy.password);
 }
 
@@ -191,10 +196,11 @@ bool AzureClient::Add(const Row& input) {
 const std::string& AzureClient::Token(Target& target, bool renew) {
     const ConnectionString& c = target.connection;
     if (!c.sharedSignature.empty()) return c.sharedSignature;  // given whole, cannot be renewed
-    const std::int64_t now = std::time(nullptr);
+    const std::int64_t now = m_options.clock->UnixSeconds();
     if (renew || target.token.empty() || now >= target.tokenExpiry - m_options.tokenRenewBefore.count()) {
         const std::int64_t expiry = now + m_options.tokenValidity.count();
         SasToken token = MakeSasToken(target.resourceUri, c.keyName, c.key, expiry);
+        ++m_lastSend.tokens;
         m_log.AddSignature(target.id, token.signature);
         if (!target.token.empty()) OPENSSL_cleanse(target.token.data(), target.token.size());
         target.token = std::move(token.token);
@@ -237,7 +243,7 @@ AzureClient::MessageOutcome AzureClient::SendMessage(std::size_t first, std::siz
     bool renewed = false;
     int attempt = 0;
     while (true) {
-        const auto remaining = duration_cast<milliseconds>(deadline - Clock::now());
+        const auto remaining = duration_cast<milliseconds>(deadline - m_options.clock->Now());
         if (remaining <= milliseconds(0)) {
             return {MessageResult::Failed,
                     "the send time bound of " + std::to_string(m_options.sendBudget.count()) + " ms ran out"};
@@ -289,7 +295,7 @@ AzureClient::MessageOutcome AzureClient::SendMessage(std::size_t first, std::siz
         }
         const auto asked = RetryAfter(response);
         const milliseconds wait = asked ? *asked : m_backoff.Delay(attempt);
-        if (Clock::now() + wait >= deadline) {
+        if (m_options.clock->Now() + wait >= deadline) {
             return {MessageResult::Failed, Describe(response) + "; waiting " + std::to_string(wait.count()) +
                                                " ms more would pass the send time bound of " +
                                                std::to_string(m_options.sendBudget.count()) + " ms"};
@@ -297,7 +303,7 @@ AzureClient::MessageOutcome AzureClient::SendMessage(std::size_t first, std::siz
         ++attempt;
         m_log.Info("Azure " + target.name + ": " + Describe(response) + "; retry " + std::to_string(attempt) +
                    " of " + std::to_string(m_options.maxRetries) + " in " + std::to_string(wait.count()) + " ms");
-        std::this_thread::sleep_for(wait);
+        m_options.clock->Sleep(wait);
     }
 }
 
@@ -307,7 +313,7 @@ bool AzureClient::Send() {
         m_log.Error("Azure send failed: no batch is open");
         return false;
     }
-    const auto start = Clock::now();
+    const auto start = m_options.clock->Now();
     const auto deadline = start + m_options.sendBudget;
     const std::size_t count = m_rows->Count();
 
@@ -367,7 +373,7 @@ bool AzureClient::Send() {
         m_log.Info("Azure " + m_current->name + ": sent " + std::to_string(m_lastSend.rows) + " rows in " +
                    std::to_string(m_lastSend.messages) + " messages (" + std::to_string(m_lastSend.bytes) +
                    " bytes, " + std::to_string(m_lastSend.requests) + " requests) in " +
-                   std::to_string(duration_cast<milliseconds>(Clock::now() - start).count()) + " ms");
+                   std::to_string(duration_cast<milliseconds>(m_options.clock->Now() - start).count()) + " ms");
     }
     m_rows.reset();  // the batch is closed, sent or not
     return failed == 0;

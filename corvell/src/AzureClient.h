@@ -17,6 +17,17 @@
 
 namespace corvell {
 
+// The time the client reads and waits: the steady clock bounds sends, the
+// wall clock dates tokens, and Sleep pauses between retries. Tests install
+// one that they move by hand, so retries and token renewals take no time.
+class ClientClock {
+public:
+    virtual ~ClientClock() = default;
+    virtual std::chrono::steady_clock::time_point Now() { return std::chrono::steady_clock::now(); }
+    virtual std::int64_t UnixSeconds();
+    virtual void Sleep(std::chrono::milliseconds wait);
+};
+
 struct ClientOptions {
     // Everything one SendOnlineRows may take, retries and waits included.
     std::chrono::milliseconds sendBudget{30000};
@@ -33,6 +44,7 @@ struct ClientOptions {
     std::chrono::seconds tokenValidity{3600};
     std::chrono::seconds tokenRenewBefore{300};
     std::string caFile;  // extra trust anchors (tests); empty: the system's store
+    std::shared_ptr<ClientClock> clock = std::make_shared<ClientClock>();  // never null
 };
 
 // What the last SendOnlineRows did, for tests and information records.
@@ -41,6 +53,7 @@ struct SendStats {
     std::size_t messages = 0;  // messages accepted
     std::size_t requests = 0;  // HTTP requests made
     std::size_t bytes = 0;     // body bytes accepted
+    std::size_t tokens = 0;    // tokens signed for it
 };
 
 class AzureClient {
