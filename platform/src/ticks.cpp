@@ -4,11 +4,23 @@
 #include <time.h>
 #include <unistd.h>
 
-ULONGLONG GetTickCount64() {
+#include <atomic>
+
+namespace {
+
+ULONGLONG MonotonicMilliseconds() {
     timespec ts{};
     clock_gettime(CLOCK_MONOTONIC, &ts);
     return static_cast<ULONGLONG>(ts.tv_sec) * 1000u + static_cast<ULONGLONG>(ts.tv_nsec) / 1000000u;
 }
+
+std::atomic<TickSource> g_tickSource{&MonotonicMilliseconds};
+
+}  // namespace
+
+void SetTickSource(TickSource source) { g_tickSource.store(source ? source : &MonotonicMilliseconds); }
+
+ULONGLONG GetTickCount64() { return g_tickSource.load(std::memory_order_relaxed)(); }
 
 DWORD GetTickCount() { return static_cast<DWORD>(GetTickCount64()); }
 

@@ -8,5 +8,11 @@ DWORD GetTickCount();
 // Milliseconds on the monotonic clock; never wraps.
 ULONGLONG GetTickCount64();
 void Sleep(DWORD milliseconds);
+
+// Where both tick counts come from. Tests install a clock they move by hand,
+// so schedules and deadlines run without waiting; null restores the
+// monotonic clock. Sleep always sleeps.
+using TickSource = ULONGLONG (*)();
+void SetTickSource(TickSource source);
 DWORD GetCurrentThreadId();
 DWORD GetCurrentProcessId();
