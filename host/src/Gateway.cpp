@@ -302,6 +302,7 @@ void CGateway::PrintStatus() {
 
 bool CGateway::WriteMetrics() {
     if (m_options.metricsFile.empty()) return true;
+    if (m_pRuntime) m_status.SetSimulatedChanges(m_pRuntime->ChangesFired());
     QSaveFile file(QString::fromStdString(m_options.metricsFile));
     const std::string text = m_status.PrometheusText();
     const bool ok = file.open(QIODevice::WriteOnly) &&

@@ -27,7 +27,7 @@ struct VariableState {
     // Generator state
     double number = 0;
     size_t textIndex = 0;
-    ULONGLONG nextChangeMs = 0;
+    double nextChangeMs = 0;
     std::mt19937 random;
     bool dirty = false;  // changed by the generator this tick
 };
@@ -110,6 +110,8 @@ public:
     mutable std::mutex m_lock;
     Faults m_faults;             // guarded by m_lock
     ULONGLONG m_simulatedMs = 0;  // guarded by m_lock
+    // Changes fired by the simulation (one per variable per event), read without the lock.
+    std::atomic<ULONGLONG> m_changesFired{0};
 
     // A connection point whose advises fail while the advise fault is on.
     CComPtr<CConnectionPoint> NewConnectionPoint(REFIID events);
