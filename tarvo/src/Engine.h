@@ -11,7 +11,9 @@
 #include <mutex>
 #include <random>
 #include <set>
+#include <deque>
 #include <unordered_map>
+#include <unordered_set>
 #include <utility>
 
 namespace tarvo {
@@ -34,7 +36,11 @@ struct VariableState {
 
 struct ContainerState {
     std::u16string name;
-    std::vector<size_t> members;  // variable indices, in order of adding
+    // Variable indices in order of adding; a deque, since clients take names
+    // out in the order they added them. The set answers "is it a member" for
+    // containers of 100,000 names.
+    std::deque<size_t> members;
+    std::unordered_set<size_t> memberSet;
     bool started = false;
     bool sendAll = false;  // send every member's current value at the next tick
     bool deleted = false;

@@ -203,6 +203,7 @@ private:
         std::lock_guard lock(m_engine->m_lock);
         CheckUsable();
         m_container->members.clear();
+        m_container->memberSet.clear();
         m_container->started = false;
         ReturnBool(result, true);
         return S_OK;
@@ -217,9 +218,8 @@ private:
             ReturnBool(result, false);
             return S_OK;
         }
-        auto& members = m_container->members;
-        if (std::find(members.begin(), members.end(), it->second) == members.end()) {
-            members.push_back(it->second);
+        if (m_container->memberSet.insert(it->second).second) {
+            m_container->members.push_back(it->second);
             m_container->sendAll = true;  // a started container reports the new name's value too
         }
         ReturnBool(result, true);
@@ -232,10 +232,8 @@ private:
         CheckUsable();
         const auto it = m_project->byName.find(name);
         auto& members = m_container->members;
-        const auto member = it == m_project->byName.end() ? members.end()
-                                                          : std::find(members.begin(), members.end(), it->second);
-        const bool removed = member != members.end();
-        if (removed) members.erase(member);
+        const bool removed = it != m_project->byName.end() && m_container->memberSet.erase(it->second) > 0;
+        if (removed) members.erase(std::find(members.begin(), members.end(), it->second));
         ReturnBool(result, removed);
         return S_OK;
     }
