@@ -155,9 +155,9 @@ QProcessEnvironment GatewayEnvironment(const RunFolder& folder) {
 
 }  // namespace
 
-GatewayRun::GatewayRun(const RunFolder& folder)
+GatewayRun::GatewayRun(const RunFolder& folder, const std::string& statusInterval)
     : m_process({"run", "--ini", folder.Path("skyvane.ini"), "--simulate", folder.Path("project.json"),
-                 "--status-interval", "0.5", "--metrics-file", folder.Path("gateway.prom")},
+                 "--status-interval", statusInterval, "--metrics-file", folder.Path("gateway.prom")},
                 GatewayEnvironment(folder)),
       m_metricsPath(folder.Path("gateway.prom")),
       m_startedAt(Now()) {

@@ -71,10 +71,10 @@ std::uint64_t ProcessRssBytes(pid_t pid);
 double Now();  // seconds, monotonic
 
 // skyvane-gateway with the folder's settings and project, status lines and
-// metrics every half second.
+// metrics every statusInterval seconds.
 class GatewayRun {
 public:
-    explicit GatewayRun(const RunFolder& folder);
+    explicit GatewayRun(const RunFolder& folder, const std::string& statusInterval = "0.5");
     ~GatewayRun();
     pid_t Pid() const { return m_process.Pid(); }
     double StartedAt() const { return m_startedAt; }
