@@ -110,11 +110,14 @@ DropReport CountDropReports(const std::string& logPath) {
     return report;
 }
 
-double ProcessCpuSeconds(pid_t pid) {
-    std::ifstream in("/proc/" + std::to_string(pid) + "/stat");
+namespace {
+
+// utime + stime of a /proc stat file: fields 14 and 15, counted after the
+// command's closing parenthesis (the command may hold blanks).
+double CpuSecondsOfStatFile(const std::string& path) {
+    std::ifstream in(path);
     std::string text;
     std::getline(in, text);
-    // Fields after the command's closing parenthesis: state is field 3, utime 14, stime 15.
     const size_t close = text.rfind(')');
     if (close == std::string::npos) return 0;
     std::istringstream fields(text.substr(close + 2));
@@ -128,6 +131,18 @@ double ProcessCpuSeconds(pid_t pid) {
         }
     }
     return static_cast<double>(utime + stime) / static_cast<double>(sysconf(_SC_CLK_TCK));
+}
+
+}  // namespace
+
+double ProcessCpuSeconds(pid_t pid) { return CpuSecondsOfStatFile("/proc/" + std::to_string(pid) + "/stat"); }
+
+std::map<int, double> ThreadCpuSeconds(pid_t pid) {
+    std::map<int, double> threads;
+    const QDir tasks(QString("/proc/%1/task").arg(pid));
+    for (const QString& tid : tasks.entryList(QDir::Dirs | QDir::NoDotAndDotDot))
+        threads[tid.toInt()] = CpuSecondsOfStatFile(tasks.filePath(tid + "/stat").toStdString());
+    return threads;
 }
 
 std::uint64_t ProcessRssBytes(pid_t pid) {

@@ -7,6 +7,7 @@
 #include "GatewayProcess.h"
 
 #include <cstdint>
+#include <map>
 #include <memory>
 #include <string>
 #include <vector>
@@ -67,6 +68,8 @@ DropReport CountDropReports(const std::string& logPath);
 
 // CPU seconds (user and system) and resident memory of a process.
 double ProcessCpuSeconds(pid_t pid);
+// CPU seconds of each thread of a process, by thread id.
+std::map<int, double> ThreadCpuSeconds(pid_t pid);
 std::uint64_t ProcessRssBytes(pid_t pid);
 double Now();  // seconds, monotonic
 

@@ -41,7 +41,7 @@ struct Plan {
     double window = 5.0;   // a measured window
     double idle = 60.0;
     double clientSeconds = 3.0;  // each bare-sender and receiver-ceiling loop
-    std::vector<double> rates{100000, 200000, 250000, 300000, 400000, 500000};
+    std::vector<double> rates{100000, 200000, 300000, 400000, 500000};
     int integrityEvery = 5;  // seconds, for the full-send stage
 };
 
@@ -296,7 +296,7 @@ struct Footprint {
 
 Footprint RunFootprint(AzureLocalProcess& receiver, int projectVariables, int configured) {
     e2e::RunFolder folder;
-    folder.WriteProject({projectVariables, 0, 10, 0});
+    folder.WriteProject({projectVariables, 0, 100, 0});
     folder.WriteSettings({configured, 1, BodyFormat::Json, 3600}, receiver);
     folder.WriteLogConfig();
     Require(receiver.Reset(), "the receiver does not answer");
@@ -337,27 +337,32 @@ double RunIdle(AzureLocalProcess& receiver, int variables, int configured, int i
 }
 
 struct FullSend {
-    double cpu = 0, seconds = 0;
+    double workerCpu = 0, processCpu = 0, seconds = 0;
     std::uint64_t bytes = 0;
 };
 
-// One full send of every variable's current value: the gateway's CPU over the
-// interval that holds it (idle time included) and the body bytes it sent.
+// One full send of every variable's current value: the CPU of the thread
+// that did most in the interval holding it (the worker: encoding and HTTP),
+// the whole process's, and the body bytes sent.
 FullSend RunFullSend(AzureLocalProcess& receiver, int variables, int integritySeconds) {
     e2e::RunFolder folder;
-    folder.WriteProject({variables, 0, 10, 0});
+    folder.WriteProject({variables, 0, 100, 0});
     folder.WriteSettings({variables, 1, BodyFormat::Json, integritySeconds}, receiver);
     folder.WriteLogConfig();
     Require(receiver.Reset(), "the receiver does not answer");
     e2e::GatewayRun gateway(folder);
     const auto all = static_cast<std::uint64_t>(variables);
-    const auto first = receiver.WaitForRows(all, 120000);
-    Require(first.rows >= all, "the first values did not arrive");
+    Require(receiver.WaitForRows(all, 120000).rows >= all, "the first values did not arrive");
+    const auto threads0 = e2e::ThreadCpuSeconds(gateway.Pid());
     const double cpu0 = e2e::ProcessCpuSeconds(gateway.Pid()), t0 = e2e::Now();
     const auto s0 = receiver.Stats();
     const auto s1 = receiver.WaitForRows(s0.rows + all, 60000);
     Require(s1.rows >= s0.rows + all, "no full send came");
-    FullSend send{e2e::ProcessCpuSeconds(gateway.Pid()) - cpu0, e2e::Now() - t0, s1.bytes - s0.bytes};
+    FullSend send{0, e2e::ProcessCpuSeconds(gateway.Pid()) - cpu0, e2e::Now() - t0, s1.bytes - s0.bytes};
+    for (const auto& [tid, cpu] : e2e::ThreadCpuSeconds(gateway.Pid())) {
+        const auto before = threads0.find(tid);
+        send.workerCpu = std::max(send.workerCpu, cpu - (before == threads0.end() ? 0.0 : before->second));
+    }
     Require(gateway.Stop() == 0, "the gateway did not stop cleanly");
     return send;
 }
@@ -473,9 +478,10 @@ void MeasureFootprints(Receivers& receivers, const Plan& plan, Table& table) {
 
 void MeasureFullSend(Receivers& receivers, const Plan& plan, Table& table) {
     const FullSend send = RunFullSend(*receivers.counting, plan.bigVariables, plan.integrityEvery);
-    table.Add({"full send", std::to_string(plan.bigVariables) + " valid variables, JSON x1",
-               Format("%.2f s CPU", send.cpu) + Format(", %.1f MB", static_cast<double>(send.bytes) / 1e6),
-               Format("over %.1f s, idle included", send.seconds), "", "<= 1 s CPU", Verdict(send.cpu <= 1.0)});
+    table.Add({"full send", std::to_string(plan.bigVariables) + " valid variables, JSON x1, worker thread",
+               Format("%.2f s CPU", send.workerCpu) + Format(", %.1f MB", static_cast<double>(send.bytes) / 1e6),
+               Format("whole process %.2f s CPU", send.processCpu) + Format(" over %.1f s", send.seconds), "",
+               "<= 1 s CPU", Verdict(send.workerCpu <= 1.0)});
 }
 
 }  // namespace

@@ -8,9 +8,6 @@
 #include "platform/collections.h"
 #include "platform/sync.h"
 
-#include <string>
-#include <unordered_set>
-
 class COnlVariables : public CCmdTarget {
 public:
     explicit COnlVariables(IOnlVariablesNtf* pNotify) : m_xOnlVariableEv(this), m_pNotify(pNotify) {}
@@ -46,7 +43,6 @@ private:
     XOnlVariableEv m_xOnlVariableEv;
     CComPtr<IDispatch> m_pContainer;  // the runtime's container, null while detached
     CStringList m_lstNames;           // names added, in order
-    std::unordered_set<std::u16string> m_setNames;  // the same names, for the test against adding one twice
     CCriticalSection m_csIds;         // guards m_mapIds: read on the runtime's event thread
     CMapOwner<DWORD, DWORD, CVarItem*> m_mapIds;  // runtime id -> holder cell (owns the cells only)
     IOnlVariablesNtf* m_pNotify;

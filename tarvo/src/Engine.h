@@ -13,7 +13,6 @@
 #include <set>
 #include <deque>
 #include <unordered_map>
-#include <unordered_set>
 #include <utility>
 
 namespace tarvo {
@@ -37,10 +36,10 @@ struct VariableState {
 struct ContainerState {
     std::u16string name;
     // Variable indices in order of adding; a deque, since clients take names
-    // out in the order they added them. The set answers "is it a member" for
-    // containers of 100,000 names.
+    // out in the order they added them. isMember (by variable index) answers
+    // "is it a member" for containers of 100,000 names.
     std::deque<size_t> members;
-    std::unordered_set<size_t> memberSet;
+    std::vector<bool> isMember;
     bool started = false;
     bool sendAll = false;  // send every member's current value at the next tick
     bool deleted = false;
