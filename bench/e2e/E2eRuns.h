@@ -82,6 +82,8 @@ public:
     pid_t Pid() const { return m_process.Pid(); }
     double StartedAt() const { return m_startedAt; }
     Metrics ReadMetrics() const { return e2e::ReadMetrics(m_metricsPath); }
+    // Waits for an output line holding the text; false at the time-out.
+    bool WaitForLine(const std::string& text, int timeoutMs) { return !m_process.WaitForText(text, timeoutMs).empty(); }
     // SIGTERM and the exit code (-1: it did not end in time).
     int Stop();
 
