@@ -83,7 +83,8 @@ std::string FormatOf(const HttpRequest& request) {
 // Rows of a body without decoding it. Exact for bodies as the client writes
 // them: a quote or "<" inside a text is escaped, so the row openings below
 // appear nowhere else. Empty when the body is not of that format.
-std::optional<quint64> CountRows(const std::string& format, const QByteArray& body) {
+std::optional<quint64> CountRows(const std::string& formatAnyCase, const QByteArray& body) {
+    const std::string format = QByteArray::fromStdString(formatAnyCase).toUpper().toStdString();
     const std::string_view text(body.constData(), static_cast<std::size_t>(body.size()));
     auto occurrences = [&text](std::string_view opening) {
         quint64 count = 0;
