@@ -188,6 +188,14 @@ public:
         EXPECT_TRUE(runs) << m_gateway->Errors();
         return runs;
     }
+    // Receiver, runtime and gateway, and the first changes arrived.
+    bool StartSending() { return StartSending(Settings{}); }
+    bool StartSending(const Settings& settings) {
+        if (!StartReceiver() || !StartRuntime() || !StartGateway(settings)) return false;
+        const bool arrived = Warm();
+        EXPECT_TRUE(arrived) << Account().Text();
+        return arrived;
+    }
     bool WaitForModuleRun(int timeoutMs = 30000) {
         return m_gateway->WaitForLine(
                    [](const std::string& line) {

@@ -103,13 +103,10 @@ INSTANTIATE_TEST_SUITE_P(
 // integrity cycle brings every current value.
 TEST(FaultMatrixLong, ReceiverBackAfterSixtySecondsGetsEveryCurrentValue) {
     FaultBench bench;
-    ASSERT_TRUE(bench.StartReceiver());
-    const int port = bench.Receiver().Port();
-    ASSERT_TRUE(bench.StartRuntime());
     FaultBench::Settings settings;
     settings.integritySeconds = 5;
-    ASSERT_TRUE(bench.StartGateway(settings));
-    ASSERT_TRUE(bench.Warm()) << bench.Account().Text();
+    ASSERT_TRUE(bench.StartSending(settings));
+    const int port = bench.Receiver().Port();
 
     bench.StopReceiver();
     const auto back = Clock::now() + std::chrono::seconds(60);
@@ -132,10 +129,7 @@ TEST(FaultMatrixLong, ReceiverBackAfterSixtySecondsGetsEveryCurrentValue) {
 // that once the switching ends every current value arrives.
 TEST(FaultMatrixLong, ProjectsSwitchedInactiveAndActiveAHundredTimesUnderLoad) {
     FaultBench bench;
-    ASSERT_TRUE(bench.StartReceiver());
-    ASSERT_TRUE(bench.StartRuntime());
-    ASSERT_TRUE(bench.StartGateway());
-    ASSERT_TRUE(bench.Warm()) << bench.Account().Text();
+    ASSERT_TRUE(bench.StartSending());
     for (int i = 0; i < 100; ++i) {
         bench.SetActive("Line", false);
         ASSERT_TRUE(bench.WaitForSubscriptions()) << "round " << i;
@@ -163,10 +157,7 @@ TEST(FaultMatrixLong, ProjectsSwitchedInactiveAndActiveAHundredTimesUnderLoad) {
 // changes arrive again.
 TEST(FaultMatrixLong, RuntimeStoppedAndStartedAgainUnderTheModule) {
     FaultBench bench;
-    ASSERT_TRUE(bench.StartReceiver());
-    ASSERT_TRUE(bench.StartRuntime());
-    ASSERT_TRUE(bench.StartGateway());
-    ASSERT_TRUE(bench.Warm()) << bench.Account().Text();
+    ASSERT_TRUE(bench.StartSending());
     bench.HoldWorkerInRetry(2);
     bench.Tick(3);
     EXPECT_TRUE(bench.StopRuntime());
@@ -183,10 +174,7 @@ TEST(FaultMatrixLong, RuntimeStoppedAndStartedAgainUnderTheModule) {
 
 TEST(FaultMatrixLong, SighupEverySecondForAMinuteUnderLoad) {
     FaultBench bench;
-    ASSERT_TRUE(bench.StartReceiver());
-    ASSERT_TRUE(bench.StartRuntime());
-    ASSERT_TRUE(bench.StartGateway());
-    ASSERT_TRUE(bench.Warm()) << bench.Account().Text();
+    ASSERT_TRUE(bench.StartSending());
     const auto start = Clock::now();
     constexpr int kReloads = 60;
     for (int i = 1; i <= kReloads; ++i) {
@@ -209,10 +197,7 @@ TEST(FaultMatrixLong, SighupEverySecondForAMinuteUnderLoad) {
 // SIGTERM while the worker holds a batch and more changes wait in the queue.
 TEST(FaultMatrixLong, SigtermUnderFullLoadEndsWithinTwoSecondsAndRecordsWhatWasNotSent) {
     FaultBench bench;
-    ASSERT_TRUE(bench.StartReceiver());
-    ASSERT_TRUE(bench.StartRuntime());
-    ASSERT_TRUE(bench.StartGateway());
-    ASSERT_TRUE(bench.Warm()) << bench.Account().Text();
+    ASSERT_TRUE(bench.StartSending());
     bench.HoldWorkerInRetry(1);
     bench.Tick(3);
     const long long stopMs = bench.StopGateway();
