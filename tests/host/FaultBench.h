@@ -77,6 +77,7 @@ public:
                                                    "brennic.ini", "[file]\npath = " + m_logFile + "\n[stderr]\nenabled = no\n")));
     }
     ~FaultBench() {
+        if (m_receiver && !m_epochs.empty()) std::printf("[ ledger   ] %s\n", Account().Text().c_str());
         m_gateway.reset();
         m_control.reset();
         m_runtime.Kill(SIGKILL);

@@ -2,7 +2,7 @@
 // another process and azure-local, under every fault the receiver, the network
 // and the runtime can show. Each case checks the loss accounting: every change
 // the runtime delivered arrived, or the module's log counts it as a failed row,
-// as dropped by a full queue or as lost at a stop; nothing arrives twice but a
+// as dropped by a full queue or as thrown away unsent; nothing arrives twice but a
 // retried message (same message id) or a value the design sends again.
 #include "FaultBench.h"
 
@@ -66,6 +66,9 @@ TEST_P(FaultMatrix, EveryChangeArrivesOrIsRecordedAsLost) {
     bench.ExpectExactAccount();
     const Ledger ledger = bench.Account();
     EXPECT_EQ(ledger.Missing() > 0, c.loses) << ledger.Text();
+    if (c.target == Target::UnverifiedTls) {
+        EXPECT_NE(bench.LogTail(1000).find("TLS failure"), std::string::npos) << "refused for its certificate";
+    }
     EXPECT_GE(bench.StopGateway(), 0) << "the gateway stops cleanly after the fault";
 }
 
