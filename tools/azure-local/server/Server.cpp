@@ -311,7 +311,7 @@ std::optional<Fault> Server::TakeFault(const HttpRequest& request) {
 
 HttpReply Server::FaultReply(const Fault& fault, const HttpRequest& request) const {
     const QByteArray authorization = request.headers.value("authorization");
-    QByteArray detail = "injected fault";
+    QByteArray detail = fault.detail.isEmpty() ? QByteArray("injected fault") : fault.detail;
     if (fault.kind == Fault::Kind::EchoAuthorization) {
         detail = "token " + authorization;
     } else if (fault.kind == Fault::Kind::EchoSignature) {
@@ -430,6 +430,7 @@ HttpReply Server::HandleControl(const HttpRequest& request, const QByteArray& pa
         if (q.hasQueryItem("at")) fault.skip = q.queryItemValue("at").toInt(&ok) - 1;
         if (!ok || fault.skip < 0) return ErrorReply(400, "at is a positive number");
         fault.match = q.queryItemValue("match", QUrl::FullyDecoded).toUtf8();
+        fault.detail = q.queryItemValue("detail", QUrl::FullyDecoded).toUtf8();
         fault.retryAfter = q.queryItemValue("retry-after").toUtf8();
         fault.retryAfterMs = q.queryItemValue("retry-after-ms").toUtf8();
         m_faults.push_back(fault);

@@ -68,6 +68,7 @@ struct Fault {
     int remaining = 1;
     int skip = 0;             // requests to let through first (at=N: the Nth request from now)
     QByteArray match;         // applies only to requests whose body holds this text
+    QByteArray detail;        // the error text of a status fault; empty: "injected fault"
 };
 
 class Server : public QObject {

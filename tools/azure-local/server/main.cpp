@@ -21,7 +21,7 @@ int main(int argc, char** argv) {
         "POST /_control/reset,\n"
         "POST /_control/limit?bytes=N[&kind=service-bus|event-hub],\n"
         "POST /_control/fault?kind=status|stall|close|echo-auth|echo-signature"
-        "&status=N&count=N&at=N&match=TEXT&retry-after=S&retry-after-ms=MS");
+        "&status=N&count=N&at=N&match=TEXT&detail=TEXT&retry-after=S&retry-after-ms=MS");
     parser.addHelpOption();
     parser.addOptions({
         {"port", "Port to listen on (0: a free one).", "n", "0"},
