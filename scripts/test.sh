@@ -14,4 +14,6 @@ ctest --output-on-failure -j2
 if [[ "$flavour" == release ]]; then
   # The demo as a smoke step: the whole road from the README's first command, shortened.
   bash "$top/scripts/demo.sh" --duration 5
+  # The end-to-end benchmarks as a smoke step: every stage runs, no figure is judged.
+  "$build/bin/skyvane_e2e_bench" --smoke
 fi

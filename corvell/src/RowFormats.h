@@ -31,6 +31,7 @@ struct Row {
 
 // "YYYY-MM-DDThh:mm:ss.mmmZ"
 std::string FormatIsoTime(std::int64_t seconds, unsigned milliseconds);
+void AppendIsoTime(std::string& out, std::int64_t seconds, unsigned milliseconds);
 
 void AppendJsonRow(std::string& out, const Row& row);
 void AppendXmlRow(std::string& out, const Row& row);

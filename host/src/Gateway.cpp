@@ -7,7 +7,7 @@
 #include "tarvo/TarvoIds.h"
 
 #include <QCoreApplication>
-#include <QSaveFile>
+#include <QFile>
 
 #include <cerrno>
 #include <cmath>
@@ -300,15 +300,29 @@ void CGateway::PrintStatus() {
     GatewaySay(m_status.TakeIntervalLine(seconds));
 }
 
+// Written beside the file and renamed over it, so that a reader never sees
+// half a file, but not synced to disk: this runs on the event loop the
+// module's timer shares, and a sync on a busy disk held the timer (and with it
+// every value change) up for hundreds of milliseconds. A file that a crash
+// leaves behind is replaced at the next interval.
 bool CGateway::WriteMetrics() {
     if (m_options.metricsFile.empty()) return true;
-    QSaveFile file(QString::fromStdString(m_options.metricsFile));
+    if (m_pRuntime) m_status.SetSimulatedChanges(m_pRuntime->ChangesFired());
+    const std::string temporary = m_options.metricsFile + ".tmp";  // the textfile collector reads *.prom only
+    QFile file(QString::fromStdString(temporary));
     const std::string text = m_status.PrometheusText();
-    const bool ok = file.open(QIODevice::WriteOnly) &&
-                    file.write(text.data(), static_cast<qint64>(text.size())) == static_cast<qint64>(text.size()) &&
-                    file.commit();
+    bool ok = file.open(QIODevice::WriteOnly | QIODevice::Truncate) &&
+              file.write(text.data(), static_cast<qint64>(text.size())) == static_cast<qint64>(text.size());
+    file.close();
+    std::string reason = file.errorString().toStdString();
+    ok = ok && file.error() == QFileDevice::NoError;
+    if (ok && std::rename(temporary.c_str(), m_options.metricsFile.c_str()) != 0) {
+        ok = false;
+        reason = std::strerror(errno);
+    }
+    if (!ok) std::remove(temporary.c_str());
     if (!ok && !m_bMetricsFailing)
-        GatewayError("cannot write the metrics file '" + m_options.metricsFile + "': " + file.errorString().toStdString());
+        GatewayError("cannot write the metrics file '" + m_options.metricsFile + "': " + reason);
     if (ok && m_bMetricsFailing) GatewaySay("the metrics file is written again");
     m_bMetricsFailing = !ok;
     return ok;

@@ -68,5 +68,10 @@ std::string CGatewayStatus::PrometheusText() const {
                  "Restarts of the export that failed (message 1126).", std::to_string(m_nRestartFailures));
     AppendMetric(text, "skyvane_gateway_module_running", "gauge",
                  "1 while the module exports, 0 while the gateway waits to start it.", m_bRunning ? "1" : "0");
+    if (m_bSimulating) {
+        AppendMetric(text, "skyvane_gateway_simulated_changes_total", "counter",
+                     "Variable changes the runtime stand-in of --simulate has fired.",
+                     std::to_string(m_nSimulatedChanges));
+    }
     return text;
 }

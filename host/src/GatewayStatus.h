@@ -17,6 +17,8 @@ public:
     // 1126: the module could not restart the export.
     void OnRestartFailed() { ++m_nRestartFailures; }
     void SetRunning(bool running) { m_bRunning = running; }
+    // With --simulate: the changes the runtime stand-in has fired, for the metrics.
+    void SetSimulatedChanges(ULONGLONG changes) { m_nSimulatedChanges = changes, m_bSimulating = true; }
 
     // The status line for the interval that ends now; the next interval starts at zero.
     std::string TakeIntervalLine(double intervalSeconds);
@@ -36,5 +38,7 @@ private:
     Counters m_total;
     ULONGLONG m_nStartAttempts = 0;
     ULONGLONG m_nRestartFailures = 0;
+    ULONGLONG m_nSimulatedChanges = 0;
     bool m_bRunning = false;
+    bool m_bSimulating = false;
 };

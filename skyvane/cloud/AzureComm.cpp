@@ -86,10 +86,13 @@ bool CAzureComm::AddOnlineRow(const CString& strKey, double dValue, const CStrin
             CString::Formatted(u"Value of %s not sent: its time stamp (%d s) lies outside 1970 to 2106", strKey, time));
         return false;
     }
-    CString project, variable;
-    CVarItem::SplitKey(strKey, project, variable);
-    return m_pInstance->AddOnlineRow(project, variable, 0, dValue, strValue, bIsString, static_cast<std::uint32_t>(time),
-                                     wMilliseconds, dwStatusLow, dwStatusHigh);
+    // Split as CVarItem::SplitKey does, without two new texts per row: the
+    // variable is the key's own tail, the project goes into a reused buffer.
+    const int hash = strKey.Find(u'#');
+    m_project.assign(strKey.GetString(), static_cast<size_t>(hash < 0 ? 0 : hash));
+    const char16_t* variable = strKey.GetString() + (hash < 0 ? 0 : hash + 1);
+    return m_pInstance->AddOnlineRow(m_project.c_str(), variable, 0, dValue, strValue, bIsString,
+                                     static_cast<std::uint32_t>(time), wMilliseconds, dwStatusLow, dwStatusHigh);
 }
 
 bool CAzureComm::SendOnlineRows() { return m_pInstance && m_pInstance->SendOnlineRows(); }

@@ -10,6 +10,8 @@
 #include "platform/text.h"
 #include "platform/types.h"
 
+#include <string>
+
 class CAzureComm : public corvell::ILogger {
 public:
     // The library is looked for in wrapperDir (ending in "/"); empty means the
@@ -48,4 +50,5 @@ private:
     HMODULE m_hWrapper = nullptr;
     corvell::IAzureInstance* m_pInstance = nullptr;
     CString m_strWrapperDir;  // empty: this module's directory
+    std::u16string m_project;  // the project part of the row being added
 };

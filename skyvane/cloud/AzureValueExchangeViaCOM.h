@@ -34,6 +34,7 @@ public:
     void OnProjectInactiveFailed(const CString& strProject) override;
     void OnProjectActiveFailed(const CString& strProject) override;
     void OnValueQueueFull(CString strProject, DWORD dwId) override;
+    void OnValuesDiscarded(const CString& strProject, int nCount) override;
 
 private:
     VX_KeepRefCmdPtr<CMultipleOnlVarsPerPrj> m_pLink;  // window thread only

@@ -5,6 +5,8 @@
 #include <algorithm>
 #include <cfloat>
 #include <cmath>
+#include <cstdlib>
+#include <cstring>
 #include <ctime>
 
 namespace {
@@ -12,22 +14,53 @@ namespace {
 // The latest time the conversion accepts: 3000-12-31 23:59:59 UTC.
 constexpr LONGLONG kLastTime = 32535215999;
 
-// Seconds since 1970 of calendar fields read as local time; false when the
-// fields are out of range or the time lies outside what is accepted.
-bool LocalTimeToSeconds(const SYSTEMTIME& st, LONGLONG& seconds) {
-    if (st.wMonth < 1 || st.wMonth > 12 || st.wDay < 1 || st.wDay > 31 || st.wHour > 23 || st.wMinute > 59 ||
-        st.wSecond > 59)
-        return false;
+// mktime reads the system's time zone anew on every call (glibc looks at
+// /etc/localtime each time), and it runs once per value change. Within one
+// minute of local time the offset to UTC stays the same (zones change it at
+// whole minutes), so each thread converts a minute's start once and adds the
+// seconds. The key holds TZ as well, so a changed zone setting converts anew.
+struct MinuteCache {
+    int year = -1, month = 0, day = 0, hour = 0, minute = 0;
+    char zone[64] = {};  // TZ when the minute was converted
+    std::time_t start = 0;
+};
+thread_local MinuteCache t_minute;
+
+bool SameZone(const char* zone) {
+    return zone ? std::strncmp(t_minute.zone, zone, sizeof t_minute.zone) == 0 : t_minute.zone[0] == '\0';
+}
+
+std::time_t MinuteStart(const SYSTEMTIME& st) {
+    const char* zone = std::getenv("TZ");
+    const bool cachable = !zone || std::strlen(zone) < sizeof t_minute.zone;
+    if (cachable && t_minute.year == st.wYear && t_minute.month == st.wMonth && t_minute.day == st.wDay &&
+        t_minute.hour == st.wHour && t_minute.minute == st.wMinute && SameZone(zone))
+        return t_minute.start;
     std::tm fields{};
     fields.tm_year = st.wYear - 1900;
     fields.tm_mon = st.wMonth - 1;
     fields.tm_mday = st.wDay;
     fields.tm_hour = st.wHour;
     fields.tm_min = st.wMinute;
-    fields.tm_sec = st.wSecond;
     fields.tm_isdst = -1;  // the system decides whether daylight saving applies
-    const std::time_t result = std::mktime(&fields);
-    if (result < 0 || result > kLastTime) return false;  // -1 (failure) is caught here too
+    const std::time_t start = std::mktime(&fields);
+    if (cachable && start != -1) {
+        t_minute = MinuteCache{st.wYear, st.wMonth, st.wDay, st.wHour, st.wMinute, {}, start};
+        std::strncpy(t_minute.zone, zone ? zone : "", sizeof t_minute.zone - 1);
+    }
+    return start;
+}
+
+// Seconds since 1970 of calendar fields read as local time; false when the
+// fields are out of range or the time lies outside what is accepted.
+bool LocalTimeToSeconds(const SYSTEMTIME& st, LONGLONG& seconds) {
+    if (st.wMonth < 1 || st.wMonth > 12 || st.wDay < 1 || st.wDay > 31 || st.wHour > 23 || st.wMinute > 59 ||
+        st.wSecond > 59)
+        return false;
+    const std::time_t start = MinuteStart(st);
+    if (start == -1) return false;  // mktime's failure
+    const std::time_t result = start + st.wSecond;
+    if (result < 0 || result > kLastTime) return false;
     seconds = result;
     return true;
 }

@@ -39,6 +39,16 @@ void CMainSkyvane::TakeQueuedValues(CLstOwner<CVarItem>& batch) {
     m_nQueued.store(0, std::memory_order_release);
 }
 
+// Once the export has stopped for good nothing sends the queue any more: its
+// changes are lost, and the log says how many.
+void CMainSkyvane::DiscardQueuedValues() {
+    CLstOwner<CVarItem> unsent;
+    TakeQueuedValues(unsent);
+    if (unsent.GetCount() > 0)
+        LogError(CString::Formatted(u"Export stopped: %d queued value changes were not sent and are lost",
+                                    unsent.GetCount()));
+}
+
 DWORD CMainSkyvane::WorkerProc(VX_CThread* thread) {
     if (!thread) return 1;
     return static_cast<CMainSkyvane*>(thread->GetParameter())->RunWorker(*thread);
@@ -81,28 +91,19 @@ void CMainSkyvane::RunCycle(CAzureComm& comm, bool integrity) {
 // One batch to one target: the queued rows, then, when due, every current value.
 void CMainSkyvane::SendToConnection(CAzureComm& comm, const CConnection& connection, const CLstOwner<CVarItem>& batch,
                                     bool integrity, RowCounts& cycle) {
-    if (!comm.BeginOnlineRows(connection.m_strConnection, connection.m_strQueue, connection.m_bEventHub,
-                              FormatCode(connection.m_nFormat))) {
+    RowCounts counts;
+    if (comm.BeginOnlineRows(connection.m_strConnection, connection.m_strQueue, connection.m_bEventHub,
+                             FormatCode(connection.m_nFormat))) {
+        AddRows(comm, batch, integrity, counts);
+        if (!comm.SendOnlineRows()) {
+            counts.failed += counts.succeeded;
+            counts.succeeded = 0;
+        }
+    } else {
         LogError(CString::Formatted(u"Starting to add Online Rows failed for '%s' Queue '%s'",
                                     MaskConnectionSecrets(connection.m_strConnection), connection.m_strQueue));
-        return;
-    }
-    RowCounts counts;
-    for (const CVarItem* item : batch) AddRow(comm, item->m_strName, *item->m_pRtData, counts);
-    if (integrity) {
-        for (const auto& [key, item] : m_config.m_mapVariables) {
-            // A snapshot under the item's lock; the row is added after it is released.
-            CVarItemRtData current;
-            {
-                CSingleLock lock(&item->m_pRtData->m_cs, true);
-                current = *item->m_pRtData;
-            }
-            AddRow(comm, item->m_strName, current, counts);
-        }
-    }
-    if (!comm.SendOnlineRows()) {
-        counts.failed += counts.succeeded;
-        counts.succeeded = 0;
+        // Without a batch the rows are lost as those of a failed send are, and counted so.
+        counts.failed = CountRows(batch, integrity);
     }
     cycle.succeeded += counts.succeeded;
     cycle.failed += counts.failed;
@@ -114,6 +115,33 @@ void CMainSkyvane::SendToConnection(CAzureComm& comm, const CConnection& connect
         LogInfo(CString::Formatted(u"Adding of %d Online Rows succeeded for '%s' Queue '%s'", counts.succeeded,
                                    MaskConnectionSecrets(connection.m_strConnection), connection.m_strQueue));
     }
+}
+
+// The queued changes, then, when due, every current value.
+void CMainSkyvane::AddRows(CAzureComm& comm, const CLstOwner<CVarItem>& batch, bool integrity, RowCounts& counts) {
+    for (const CVarItem* item : batch) AddRow(comm, item->m_strName, *item->m_pRtData, counts);
+    if (!integrity) return;
+    for (const auto& [key, item] : m_config.m_mapVariables) {
+        // A snapshot under the item's lock; the row is added after it is released.
+        CVarItemRtData current;
+        {
+            CSingleLock lock(&item->m_pRtData->m_cs, true);
+            current = *item->m_pRtData;
+        }
+        AddRow(comm, item->m_strName, current, counts);
+    }
+}
+
+// The rows AddRows would add.
+int CMainSkyvane::CountRows(const CLstOwner<CVarItem>& batch, bool integrity) const {
+    int rows = 0;
+    for (const CVarItem* item : batch) rows += item->m_pRtData->m_bValid ? 1 : 0;
+    if (!integrity) return rows;
+    for (const auto& [key, item] : m_config.m_mapVariables) {
+        CSingleLock lock(&item->m_pRtData->m_cs, true);
+        rows += item->m_pRtData->m_bValid ? 1 : 0;
+    }
+    return rows;
 }
 
 // Rows only for values the runtime has reported; others are not counted.

@@ -81,6 +81,7 @@ int CMainSkyvane::ExecActionOnWindowThread(CConfigData* context) {
 int CMainSkyvane::DllExitOnWindowThread(int unused) {
     m_nTickState = kTickClosed;
     StopExport();
+    DiscardQueuedValues();
     m_hHostWnd.store(nullptr);
     return CMainAccess::DllExit(unused);
 }

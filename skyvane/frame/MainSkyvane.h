@@ -77,8 +77,11 @@ private:
     DWORD RunWorker(VX_CThread& thread);
     void RunCycle(CAzureComm& comm, bool integrity);
     void TakeQueuedValues(CLstOwner<CVarItem>& batch);
+    void DiscardQueuedValues();
     void SendToConnection(CAzureComm& comm, const CConnection& connection, const CLstOwner<CVarItem>& batch,
                           bool integrity, RowCounts& cycle);
+    void AddRows(CAzureComm& comm, const CLstOwner<CVarItem>& batch, bool integrity, RowCounts& counts);
+    int CountRows(const CLstOwner<CVarItem>& batch, bool integrity) const;
     static void AddRow(CAzureComm& comm, const CString& key, const CVarItemRtData& data, RowCounts& counts);
 
     CAzureConfig m_config;  // written on the window thread only while the worker is stopped

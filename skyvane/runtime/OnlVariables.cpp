@@ -16,16 +16,19 @@ COnlVariables::~COnlVariables() {
 
 bool COnlVariables::AddVariable(IDispatch* pProject, const CString& strVariable, CVarItem** ppHolder) {
     if (!pProject) return false;
-    if (std::find(m_lstNames.begin(), m_lstNames.end(), strVariable) != m_lstNames.end()) return false;
     CComPtr<IDispatch> variables = CallForObject(pProject, tarvo::dispid::ProjectVariables);
     CComPtr<IDispatch> variable = CallForObject(variables.Get(), tarvo::dispid::CollectionItem, strVariable.GetString());
     if (!variable) return false;
     LONG id = 0;
     // A variable whose id cannot be read could never be matched to its changes.
     if (!GetLongProperty(variable.Get(), tarvo::dispid::VariableId, &id)) return false;
-    m_lstNames.AddTail(strVariable);
     CSingleLock lock(&m_csIds, true);
+    // Ids are unique within a project, so a name added before has its id in
+    // the map: searching the list of names made n names cost n^2 / 2 comparisons.
+    CVarItem** added = nullptr;
+    if (m_mapIds.Lookup(static_cast<DWORD>(id), added)) return false;
     m_mapIds.SetAt(static_cast<DWORD>(id), ppHolder);
+    m_lstNames.AddTail(strVariable);
     return true;
 }
 

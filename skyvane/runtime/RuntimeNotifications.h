@@ -43,4 +43,6 @@ public:
     virtual void OnProjectInactiveFailed(const CString& strProject) = 0;
     virtual void OnProjectActiveFailed(const CString& strProject) = 0;
     virtual void OnValueQueueFull(CString strProject, DWORD dwId) = 0;
+    // Queued changes thrown away unsent: a deactivation, a released subscription, the end.
+    virtual void OnValuesDiscarded(const CString& strProject, int nCount) = 0;
 };

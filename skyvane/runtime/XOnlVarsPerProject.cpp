@@ -222,8 +222,14 @@ void CXOnlVarsPerProject::DrainValues() {
 }
 
 void CXOnlVarsPerProject::DiscardValues() {
-    CSingleLock lock(&m_mutex, true);
-    m_lstValues.RemoveAll();
+    int discarded = 0;
+    {
+        CSingleLock lock(&m_mutex, true);
+        discarded = m_lstValues.GetCount();
+        m_lstValues.RemoveAll();
+    }
+    // Said outside the lock: the bridge writes a log record.
+    if (discarded > 0) m_pNotify->OnValuesDiscarded(m_strProject, discarded);
 }
 
 int CXOnlVarsPerProject::GetQueuedCount() {

@@ -24,7 +24,7 @@ bool Fail(std::string* error, const std::string& message) {
 
 bool ValidateGenerator(const VariableConfig& v, const std::string& where, std::string* error) {
     const GeneratorConfig& g = v.generator;
-    if (g.periodMs == 0) return Fail(error, where + ": period_ms must be at least 1");
+    if (!(g.periodMs > 0) || !std::isfinite(g.periodMs)) return Fail(error, where + ": period_ms must be above 0");
     if (g.cycleMs == 0) return Fail(error, where + ": cycle_ms must be at least 1");
     for (double d : {g.amplitude, g.offset, g.step, g.minimum, g.maximum, v.number}) {
         if (!std::isfinite(d)) return Fail(error, where + ": numbers must be finite");
@@ -159,7 +159,7 @@ private:
     bool ReadVariables(const QJsonValue& value, const std::string& where, std::vector<VariableConfig>* out) {
         if (!value.isObject()) return Fail(m_error, where + ": must be an object");
         const QJsonObject o = value.toObject();
-        if (!Keys(o, where, {"name", "id", "type", "value", "status", "generator", "repeat"})) return false;
+        if (!Keys(o, where, {"name", "id", "type", "value", "status", "generator", "repeat", "rate"})) return false;
         VariableConfig v;
         if (!o.value("name").isString()) return Fail(m_error, where + ": \"name\" must be a text");
         v.name = o.value("name").toString().toStdU16String();
@@ -179,8 +179,12 @@ private:
         if (repeat > 1 && at == std::u16string::npos) return Fail(m_error, where + ": a repeated name needs \"{n}\"");
         if (v.id != 0 && static_cast<double>(v.id) + repeat - 1 > 2147483647.0)
             return Fail(m_error, where + ": the repeated ids go past 2147483647");
+        double rate = 0;
+        if (!ReadRate(o, where, repeat, &v.generator, &rate)) return false;
         for (DWORD n = 1; n <= repeat; ++n) {
             VariableConfig copy = v;
+            // Spread over one period: every tick carries its share of the rate.
+            if (rate > 0) copy.generator.firstChangeMs = n * 1000.0 / rate;
             if (at != std::u16string::npos) copy.name.replace(at, counter.size(), Utf8ToUtf16(std::to_string(n)));
             if (v.id != 0) copy.id = v.id + static_cast<LONG>(n - 1);
             out->push_back(std::move(copy));
@@ -188,11 +192,24 @@ private:
         return true;
     }
 
+    // "rate": changes per second of all variables of the entry together; it
+    // sets their period and spreads their changes evenly over it.
+    bool ReadRate(const QJsonObject& o, const std::string& where, DWORD repeat, GeneratorConfig* g, double* rate) {
+        if (!o.contains("rate")) return true;
+        if (!Number(o, "rate", where, rate)) return false;
+        if (!(*rate > 0) || !std::isfinite(*rate)) return Fail(m_error, where + ": \"rate\" must be above 0");
+        if (g->kind == GeneratorKind::Constant) return Fail(m_error, where + ": \"rate\" needs a generator that changes");
+        if (o.value("generator").toObject().contains("period_ms"))
+            return Fail(m_error, where + ": give \"rate\" or the generator's \"period_ms\", not both");
+        g->periodMs = repeat * 1000.0 / *rate;
+        return true;
+    }
+
     bool ReadGenerator(const QJsonValue& value, const std::string& where, GeneratorConfig* g) {
         if (!value.isObject()) return Fail(m_error, where + ": must be an object");
         const QJsonObject o = value.toObject();
         if (!Keys(o, where, {"kind", "period_ms", "amplitude", "offset", "cycle_ms", "step", "min", "max", "texts",
-                             "alt_status", "seed"}))
+                             "alt_status", "seed", "stop_ms"}))
             return false;
         static const std::pair<const char*, GeneratorKind> kinds[] = {
             {"constant", GeneratorKind::Constant},       {"sine", GeneratorKind::Sine},
@@ -210,7 +227,7 @@ private:
         }
         if (!known) return Fail(m_error, where + ": unknown \"kind\" \"" + kind.toStdString() + "\"");
         if (!Unsigned(o, "period_ms", where, &g->periodMs) || !Unsigned(o, "cycle_ms", where, &g->cycleMs) ||
-            !Unsigned(o, "seed", where, &g->seed) || !Number(o, "amplitude", where, &g->amplitude) ||
+            !Unsigned(o, "seed", where, &g->seed) || !Unsigned(o, "stop_ms", where, &g->stopMs) || !Number(o, "amplitude", where, &g->amplitude) ||
             !Number(o, "offset", where, &g->offset) || !Number(o, "step", where, &g->step) ||
             !Number(o, "min", where, &g->minimum) || !Number(o, "max", where, &g->maximum) ||
             !Status(o, "alt_status", where, &g->alternateStatus))

@@ -152,7 +152,9 @@ std::vector<Event> Engine::Tick(DWORD tickMs) {
                 if (container->sendAll || project->variables[index].dirty) changed.push_back(index);
             }
             container->sendAll = false;
-            if (!changed.empty()) events.push_back(MakeBulkEvent(container->events, *project, changed));
+            if (changed.empty()) continue;
+            m_changesFired.fetch_add(changed.size(), std::memory_order_relaxed);
+            events.push_back(MakeBulkEvent(container->events, *project, changed));
         }
     }
     return events;

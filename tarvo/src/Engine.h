@@ -11,6 +11,7 @@
 #include <mutex>
 #include <random>
 #include <set>
+#include <deque>
 #include <unordered_map>
 #include <utility>
 
@@ -27,14 +28,18 @@ struct VariableState {
     // Generator state
     double number = 0;
     size_t textIndex = 0;
-    ULONGLONG nextChangeMs = 0;
+    double nextChangeMs = 0;
     std::mt19937 random;
     bool dirty = false;  // changed by the generator this tick
 };
 
 struct ContainerState {
     std::u16string name;
-    std::vector<size_t> members;  // variable indices, in order of adding
+    // Variable indices in order of adding; a deque, since clients take names
+    // out in the order they added them. isMember (by variable index) answers
+    // "is it a member" for containers of 100,000 names.
+    std::deque<size_t> members;
+    std::vector<bool> isMember;
     bool started = false;
     bool sendAll = false;  // send every member's current value at the next tick
     bool deleted = false;
@@ -110,6 +115,8 @@ public:
     mutable std::mutex m_lock;
     Faults m_faults;             // guarded by m_lock
     ULONGLONG m_simulatedMs = 0;  // guarded by m_lock
+    // Changes fired by the simulation (one per variable per event), read without the lock.
+    std::atomic<ULONGLONG> m_changesFired{0};
 
     // A connection point whose advises fail while the advise fault is on.
     CComPtr<CConnectionPoint> NewConnectionPoint(REFIID events);

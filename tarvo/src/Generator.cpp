@@ -23,7 +23,7 @@ void StartGenerator(VariableState& v) {
     v.number = v.config.number;
     v.time = NowAsOleDate();
     v.random.seed(g.seed + static_cast<std::uint32_t>(v.config.id));
-    v.nextChangeMs = g.periodMs;
+    v.nextChangeMs = g.firstChangeMs > 0 ? g.firstChangeMs : g.periodMs;
     // A text cycle goes on after the initial text when that is one of its texts.
     const auto it = std::find(g.texts.begin(), g.texts.end(), v.config.text);
     v.textIndex = it == g.texts.end() ? 0 : static_cast<size_t>(it - g.texts.begin()) + 1;
@@ -31,9 +31,10 @@ void StartGenerator(VariableState& v) {
 
 bool AdvanceGenerator(VariableState& v, ULONGLONG nowMs) {
     const GeneratorConfig& g = v.config.generator;
-    if (g.kind == GeneratorKind::Constant || nowMs < v.nextChangeMs) return false;
+    if (g.kind == GeneratorKind::Constant || static_cast<double>(nowMs) < v.nextChangeMs) return false;
+    if (g.stopMs > 0 && nowMs > g.stopMs) return false;
     // One change per due tick; a period shorter than the tick changes once per tick.
-    while (v.nextChangeMs <= nowMs) v.nextChangeMs += g.periodMs;
+    while (v.nextChangeMs <= static_cast<double>(nowMs)) v.nextChangeMs += g.periodMs;
     switch (g.kind) {
     case GeneratorKind::Constant:
         return false;

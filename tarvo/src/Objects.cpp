@@ -203,6 +203,7 @@ private:
         std::lock_guard lock(m_engine->m_lock);
         CheckUsable();
         m_container->members.clear();
+        m_container->isMember.clear();
         m_container->started = false;
         ReturnBool(result, true);
         return S_OK;
@@ -217,9 +218,11 @@ private:
             ReturnBool(result, false);
             return S_OK;
         }
-        auto& members = m_container->members;
-        if (std::find(members.begin(), members.end(), it->second) == members.end()) {
-            members.push_back(it->second);
+        auto& isMember = m_container->isMember;
+        if (isMember.size() < m_project->variables.size()) isMember.resize(m_project->variables.size());
+        if (!isMember[it->second]) {
+            isMember[it->second] = true;
+            m_container->members.push_back(it->second);
             m_container->sendAll = true;  // a started container reports the new name's value too
         }
         ReturnBool(result, true);
@@ -232,10 +235,12 @@ private:
         CheckUsable();
         const auto it = m_project->byName.find(name);
         auto& members = m_container->members;
-        const auto member = it == m_project->byName.end() ? members.end()
-                                                          : std::find(members.begin(), members.end(), it->second);
-        const bool removed = member != members.end();
-        if (removed) members.erase(member);
+        auto& isMember = m_container->isMember;
+        const bool removed = it != m_project->byName.end() && it->second < isMember.size() && isMember[it->second];
+        if (removed) {
+            isMember[it->second] = false;
+            members.erase(std::find(members.begin(), members.end(), it->second));
+        }
         ReturnBool(result, removed);
         return S_OK;
     }

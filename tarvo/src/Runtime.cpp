@@ -297,6 +297,11 @@ size_t Runtime::ProjectSinks(const std::u16string& projectName) const {
     return project ? project->events->ConnectionCount() : 0;
 }
 
+ULONGLONG Runtime::ChangesFired() const {
+    const auto engine = m->CurrentEngine();
+    return engine ? engine->m_changesFired.load(std::memory_order_relaxed) : 0;
+}
+
 long Runtime::LiveObjects() { return LiveObjectCount(); }
 
 }  // namespace tarvo

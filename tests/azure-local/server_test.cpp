@@ -9,7 +9,11 @@
 #include <openssl/evp.h>
 #include <openssl/hmac.h>
 
+#include <QDateTime>
+
+#include <chrono>
 #include <ctime>
+#include <future>
 #include <string>
 #include <vector>
 
@@ -187,6 +191,89 @@ TEST_F(ServerTest, InjectsFaultsInOrder) {
     EXPECT_FALSE(server->Fault("status=99"));
     EXPECT_FALSE(server->Fault("count=0"));
     EXPECT_EQ(server->Stats().rejected, 3u);
+}
+
+// A row stamped `ageMs` before now, in the JSON the client writes.
+std::string JsonRowBody(qint64 ageMs) {
+    const QString time = QDateTime::currentDateTimeUtc().addMSecs(-ageMs).toString(Qt::ISODateWithMs);
+    return R"([{"project":"P","variable":"V","value":1,"time":")" + time.toStdString() + R"(","status":0}])";
+}
+
+TEST_F(ServerTest, ReportsHowOldDecodedRowsAreOnArrival) {
+    EXPECT_EQ(server->Stats().latencyP50Ms, -1) << "nothing decoded yet";
+    for (int i = 0; i < 9; ++i) ASSERT_EQ(client.Post(base + "/q/messages", Headers("q"), JsonRowBody(2000)).status, 201);
+    ASSERT_EQ(client.Post(base + "/q/messages", Headers("q"), JsonRowBody(30000)).status, 201);
+    const auto stats = server->Stats();
+    EXPECT_EQ(stats.latencyRows, 10u);
+    EXPECT_GE(stats.latencyP50Ms, 2000);
+    EXPECT_LT(stats.latencyP50Ms, 12000);
+    EXPECT_GE(stats.latencyP99Ms, 30000) << "the one old row is the 99th percentile";
+    ASSERT_TRUE(server->Reset());
+    EXPECT_EQ(server->Stats().latencyRows, 0u);
+}
+
+// The benchmarks' receiver: rows counted from the body, checked against the
+// sender's RowCount, neither decoded nor recorded.
+TEST(ServerCountOnly, CountsRowsOfEveryFormatWithoutDecoding) {
+    std::string error;
+    auto server = AzureLocalProcess::Start({"--count-only"}, error);
+    ASSERT_TRUE(server) << error;
+    const std::string base = "http://127.0.0.1:" + std::to_string(server->Port());
+    RawClient client;
+    auto headers = [&](const std::string& format, const std::string& rowCount) {
+        std::vector<std::string> list{"Authorization: " + Token(server->Port(), "q"), "Format: \"" + format + "\""};
+        if (!rowCount.empty()) list.push_back("RowCount: " + rowCount);
+        return list;
+    };
+    // A text value holding a row's opening is escaped, so it does not count.
+    const std::string json = R"([{"project":"P","variable":"A","value":"{\"project\":","time":"x","status":0},)"
+                             R"({"project":"P","variable":"B","value":2,"time":"x","status":0}])";
+    EXPECT_EQ(client.Post(base + "/q/messages", headers("JSON", "2"), json).status, 201);
+    const std::string xml = R"(<?xml version="1.0" encoding="UTF-8"?><rows><row project="P">&lt;row </row>)"
+                            R"(<row project="P">2</row><row project="P">3</row></rows>)";
+    EXPECT_EQ(client.Post(base + "/q/messages", headers("xml", ""), xml).status, 201) << "the format in any case";
+    const std::string bond("CB\x01\x00\x0B\x0A\xAC\x02", 8);  // a list of 300 rows (their bytes are not read)
+    EXPECT_EQ(client.Post(base + "/q/messages", headers("BOND", "300"), bond).status, 201);
+
+    const Answer miscounted = client.Post(base + "/q/messages", headers("JSON", "3"), json);
+    EXPECT_EQ(miscounted.status, 400);
+    EXPECT_NE(miscounted.body.find("RowCount says 3"), std::string::npos) << miscounted.body;
+    EXPECT_EQ(client.Post(base + "/q/messages", headers("JSON", ""), "hello").status, 400);
+    EXPECT_EQ(client.Post(base + "/q/messages", headers("BOND", ""), "CB").status, 400);
+    auto unsigned_ = headers("JSON", "2");
+    unsigned_.erase(unsigned_.begin());
+    EXPECT_EQ(client.Post(base + "/q/messages", unsigned_, json).status, 401) << "the signature is still checked";
+
+    const auto stats = server->Stats();
+    EXPECT_EQ(stats.rows, 2u + 3u + 300u);
+    EXPECT_EQ(stats.messages, 3u);
+    EXPECT_EQ(stats.latencyRows, 0u);
+    EXPECT_TRUE(server->Rows().empty()) << "nothing is recorded";
+}
+
+TEST(ServerCountOnly, WaitAnswersWhenTheRowsHaveArrivedOrAtItsTimeOut) {
+    std::string error;
+    auto server = AzureLocalProcess::Start({"--count-only"}, error);
+    ASSERT_TRUE(server) << error;
+    EXPECT_TRUE(server->WaitForRows(0, 1000).answered) << "already there: at once";
+    const auto timedOut = server->WaitForRows(5, 200);
+    EXPECT_TRUE(timedOut.answered);
+    EXPECT_EQ(timedOut.rows, 0u);
+
+    using Clock = std::chrono::steady_clock;
+    const auto start = Clock::now();
+    auto waiting = std::async(std::launch::async, [&] { return server->WaitForRows(2, 60000); });
+    RawClient client;
+    const std::string json = R"([{"project":"P","variable":"A","value":1,"time":"x","status":0},)"
+                             R"({"project":"P","variable":"B","value":2,"time":"x","status":0}])";
+    // The message may come before the wait is registered; either way the answer has both rows.
+    EXPECT_EQ(client.Post("http://127.0.0.1:" + std::to_string(server->Port()) + "/q/messages",
+                          {"Authorization: " + Token(server->Port(), "q"), "Format: \"JSON\""}, json)
+                  .status,
+              201);
+    const auto arrived = waiting.get();
+    EXPECT_EQ(arrived.rows, 2u);
+    EXPECT_LT(Clock::now() - start, std::chrono::seconds(30)) << "answered by the arrival, not the time-out";
 }
 
 TEST(ServerStart, RefusesNonLoopbackAddresses) {

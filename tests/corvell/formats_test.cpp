@@ -147,6 +147,7 @@ TEST(IsoTime, CalendarEdges) {
     EXPECT_EQ(FormatIsoTime(951782400, 999), "2000-02-29T00:00:00.999Z");  // leap day of a century leap year
     EXPECT_EQ(FormatIsoTime(4294967295, 0), "2106-02-07T06:28:15.000Z");   // largest 32-bit time
     EXPECT_EQ(FormatIsoTime(-1, 0), "1969-12-31T23:59:59.000Z");
+    EXPECT_EQ(FormatIsoTime(253402300800, 5), "10000-01-01T00:00:00.005Z");  // past four digits of year
 }
 
 // Every UTF-16 text, including lone surrogates and characters XML cannot carry,

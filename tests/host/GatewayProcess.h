@@ -95,6 +95,7 @@ public:
         return m_exitCode;
     }
 
+    pid_t Pid() const { return m_pid; }
     const std::vector<std::string>& Lines() { return m_lines; }
     std::string Errors() { return m_errors; }
 

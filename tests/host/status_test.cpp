@@ -35,6 +35,9 @@ TEST(GatewayStatus, IntervalLinesStartFromZeroWhileTotalsKeepCounting) {
     EXPECT_EQ(Sample(text, "skyvane_gateway_cycle_seconds_total"), "0.021");
     EXPECT_EQ(Sample(text, "skyvane_gateway_cycle_seconds_max"), "0.012");
     EXPECT_EQ(Sample(text, "skyvane_gateway_module_running"), "0");
+    EXPECT_EQ(Sample(text, "skyvane_gateway_simulated_changes_total"), "(missing)") << "only with --simulate";
+    status.SetSimulatedChanges(123456789012);
+    EXPECT_EQ(Sample(status.PrometheusText(), "skyvane_gateway_simulated_changes_total"), "123456789012");
 }
 
 TEST(GatewayStatus, DurationIsTheModulesThirtyTwoBitTickDifference) {

@@ -39,12 +39,12 @@ inline CComPtr<IDispatch> Project(const std::u16string& name) {
 
 // A container of a project, reset, with these names added and (optionally) started.
 inline CComPtr<IDispatch> OpenContainer(IDispatch* project, const std::u16string& name,
-                                        std::initializer_list<const char16_t*> variables, bool start = true) {
+                                        const std::vector<std::u16string>& variables, bool start = true) {
     const CComVariant containers = CallMethodOrThrow(project, ProjectContainers);
     CComPtr<IDispatch> container = AsObject(CallMethodOrThrow(containers.pdispVal, ContainersCreate, name.c_str()));
     CallMethodOrThrow(container.Get(), ContainerReset);
-    for (const char16_t* variable : variables) {
-        const CComVariant added = CallMethodOrThrow(container.Get(), ContainerAdd, variable);
+    for (const std::u16string& variable : variables) {
+        const CComVariant added = CallMethodOrThrow(container.Get(), ContainerAdd, variable.c_str());
         EXPECT_EQ(added.vt, VT_BOOL);
         EXPECT_NE(added.boolVal, VARIANT_FALSE) << "not added";
     }

@@ -65,6 +65,22 @@ TEST(ProjectFile, DefaultsAndIds) {
     EXPECT_EQ(p.variables[1].generator.kind, GeneratorKind::Constant);
 }
 
+// A rate is shared by the variables of the entry and spread over one period.
+TEST(ProjectFile, RateSetsThePeriodAndSpreadsTheChanges) {
+    tarvo::RuntimeConfig config;
+    std::string error;
+    ASSERT_TRUE(tarvo::ParseProjectJson(
+        OneVariable(R"({"name": "v{n}", "repeat": 4, "rate": 200, "generator": {"kind": "counter"}})"), &config,
+        &error))
+        << error;
+    const auto& variables = config.projects[0].variables;
+    ASSERT_EQ(variables.size(), 4u);
+    for (size_t n = 0; n < variables.size(); ++n) {
+        EXPECT_DOUBLE_EQ(variables[n].generator.periodMs, 20.0);  // 4 variables at 200 changes/s
+        EXPECT_DOUBLE_EQ(variables[n].generator.firstChangeMs, 5.0 * static_cast<double>(n + 1));
+    }
+}
+
 TEST(ProjectFile, BadFilesAreRejectedWithTheReason) {
     ExpectRejected("{", "not valid JSON");
     ExpectRejected("[]", "one JSON object");
@@ -93,6 +109,11 @@ TEST(ProjectFile, BadFilesAreRejectedWithTheReason) {
                    "needs a number variable");
     ExpectRejected(OneVariable(R"({"name": "a", "generator": {"kind": "ramp", "min": 5, "max": 1}})"), "min");
     ExpectRejected(OneVariable(R"({"name": "a", "generator": {"kind": "ramp", "texts": [1]}})"), "texts");
+    ExpectRejected(OneVariable(R"({"name": "a", "rate": 10})"), "needs a generator that changes");
+    ExpectRejected(OneVariable(R"({"name": "a", "rate": 0, "generator": {"kind": "counter"}})"), "\"rate\"");
+    ExpectRejected(OneVariable(R"({"name": "a", "rate": "fast", "generator": {"kind": "counter"}})"), "\"rate\"");
+    ExpectRejected(OneVariable(R"({"name": "a", "rate": 5, "generator": {"kind": "counter", "period_ms": 10}})"),
+                   "not both");
 
     tarvo::RuntimeConfig config;
     std::string error;

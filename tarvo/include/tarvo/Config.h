@@ -23,7 +23,9 @@ enum class GeneratorKind {
 
 struct GeneratorConfig {
     GeneratorKind kind = GeneratorKind::Constant;
-    DWORD periodMs = 1000;  // time between two changes, simulated time
+    double periodMs = 1000;  // time between two changes, simulated time
+    double firstChangeMs = 0;  // simulated time of the first change; 0: one period after the start
+    DWORD stopMs = 0;          // no changes after this simulated time; 0: never
     double amplitude = 1.0;
     double offset = 0.0;
     DWORD cycleMs = 60000;  // sine wave length

@@ -108,6 +108,9 @@ public:
     std::vector<ContainerInfo> Containers(const std::u16string& project) const;
     std::optional<LONG> VariableId(const std::u16string& project, const std::u16string& variable) const;
     size_t ProjectSinks(const std::u16string& project) const;
+    // Variable changes the simulation's ticks have fired since the start (each
+    // variable of each bulk event counts once); 0 when not running.
+    ULONGLONG ChangesFired() const;
 
     // Automation objects of every runtime in this process that are still alive.
     static long LiveObjects();

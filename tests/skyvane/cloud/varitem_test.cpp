@@ -9,6 +9,7 @@
 #include <atomic>
 #include <cmath>
 #include <cstdlib>
+#include <ctime>
 #include <filesystem>
 #include <limits>
 #include <thread>
@@ -144,6 +145,35 @@ TEST_F(VarItemTest, DaylightSavingInTheLocalZone) {
     EXPECT_EQ(data.m_time, 1719828000);
     ASSERT_TRUE(Report(4.0, 0, 0, At(45592.0, 3, 0, 0)));  // 2024-10-27 03:00, CET again
     EXPECT_EQ(data.m_time, 1729994400);
+}
+
+// Every second of the hours around both changes, against the C library's own
+// conversion: the per-minute conversion must not move any time stamp. In the
+// autumn hour that comes twice either reading is right.
+TEST_F(VarItemTest, EverySecondAroundTheChangesAsTheCLibraryConvertsIt) {
+    SetZone("Europe/Berlin");
+    const DATE october27_2024 = 45592.0;
+    double value = 0;
+    for (const DATE day : {kMarch31_2024, october27_2024}) {
+        for (int second = 3600; second < 4 * 3600; ++second) {  // 01:00:00 to 03:59:59 local
+            ASSERT_TRUE(Report(++value, 0, 0, At(day, 0, 0, second)));
+            std::tm fields{};
+            fields.tm_year = 124;
+            fields.tm_mon = day == kMarch31_2024 ? 2 : 9;
+            fields.tm_mday = day == kMarch31_2024 ? 31 : 27;
+            fields.tm_hour = second / 3600;
+            fields.tm_min = second / 60 % 60;
+            fields.tm_sec = second % 60;
+            fields.tm_isdst = -1;
+            const LONGLONG expected = std::mktime(&fields);
+            const bool twice = day == october27_2024 && second / 3600 == 2;
+            if (twice) EXPECT_TRUE(data.m_time == expected || data.m_time == expected + 3600 || data.m_time == expected - 3600) << second;
+            else ASSERT_EQ(data.m_time, expected) << "second " << second << " of the day";
+        }
+    }
+    SetZone("UTC");  // a changed zone applies at once, also within the same minute
+    ASSERT_TRUE(Report(++value, 0, 0, At(kMarch31_2024, 3, 59, 30)));
+    EXPECT_EQ(data.m_time, 1711857570);  // 2024-03-31 03:59:30 UTC
 }
 
 TEST_F(VarItemTest, ReaderUnderTheLockSeesOneReport) {

@@ -63,6 +63,10 @@ public:
         queueFull.push_back(id);
         (void)project;
     }
+    void OnValuesDiscarded(const CString& project, int count) override {
+        std::lock_guard<std::mutex> guard(lock);
+        discarded.push_back({project, count});
+    }
 
     size_t ChangeCount() {
         std::lock_guard<std::mutex> guard(lock);
@@ -73,6 +77,7 @@ public:
     std::vector<Change> changes;
     std::vector<CString> deactivated, activated, inactiveFailed, activeFailed;
     std::vector<DWORD> queueFull;
+    std::vector<std::pair<CString, int>> discarded;  // every report of queued changes thrown away
     std::vector<STarvoVarValue*> keptRecords;
     bool keepNext = false;
 
@@ -477,6 +482,7 @@ TEST_P(RuntimeLink, DeactivationDiscardsAndStopsThenActivationResubscribes) {
     ASSERT_EQ(target.deactivated.size(), 1u);
     EXPECT_TRUE(target.inactiveFailed.empty());
     EXPECT_TRUE(target.changes.empty());  // discarded, not forwarded
+    EXPECT_EQ(target.discarded, (std::vector<std::pair<CString, int>>{{u"Plant", 1}})) << "and said so";
     auto stopped = runtime->Containers(u"Plant");
     ASSERT_EQ(stopped.size(), 1u);
     EXPECT_FALSE(stopped[0].started);
@@ -624,6 +630,7 @@ TEST_P(RuntimeLink, ReleasingVariablesDropsChangesThatReferToTheirCells) {
     EXPECT_EQ(Project(u"Line2")->GetQueuedCount(), 0);
     manager->ProcessPending();
     EXPECT_TRUE(target.changes.empty());  // no record with a freed holder cell reaches the bridge
+    EXPECT_EQ(target.discarded, (std::vector<std::pair<CString, int>>{{u"Line2", 1}}));
     EXPECT_FALSE(runtime->Containers(u"Line2").at(0).started);
 }
 

@@ -138,7 +138,8 @@ std::string AzureLocalProcess::ConnectionString(const std::string& extra) const 
            ";SharedAccessKey=" + kKey + ";UseDevelopmentEmulator=true" + extra;
 }
 
-bool AzureLocalProcess::Control(const std::string& method, const std::string& path, std::string* body) {
+bool AzureLocalProcess::Control(const std::string& method, const std::string& path, std::string* body,
+                                long timeoutSeconds) {
     CURL* curl = curl_easy_init();
     if (!curl) return false;
     std::string answer;
@@ -148,7 +149,7 @@ bool AzureLocalProcess::Control(const std::string& method, const std::string& pa
     if (!m_tlsCertificate.empty()) curl_easy_setopt(curl, CURLOPT_CAINFO, m_tlsCertificate.c_str());
     curl_easy_setopt(curl, CURLOPT_NOPROXY, "*");
     curl_easy_setopt(curl, CURLOPT_NOSIGNAL, 1L);
-    curl_easy_setopt(curl, CURLOPT_TIMEOUT, 10L);
+    curl_easy_setopt(curl, CURLOPT_TIMEOUT, timeoutSeconds);
     if (method == "POST") {
         curl_easy_setopt(curl, CURLOPT_POST, 1L);
         curl_easy_setopt(curl, CURLOPT_POSTFIELDS, "");
@@ -169,12 +170,20 @@ bool AzureLocalProcess::SetLimit(std::size_t bytes, const std::string& kind) {
     return Control("POST", "/_control/limit?bytes=" + std::to_string(bytes) + (kind.empty() ? "" : "&kind=" + kind));
 }
 
-ServerStats AzureLocalProcess::Stats() {
+ServerStats AzureLocalProcess::Stats() { return ReadStats("/_control/stats", 10); }
+
+ServerStats AzureLocalProcess::WaitForRows(std::uint64_t rows, int timeoutMs) {
+    return ReadStats("/_control/wait?rows=" + std::to_string(rows) + "&timeout-ms=" + std::to_string(timeoutMs),
+                     timeoutMs / 1000 + 10);
+}
+
+ServerStats AzureLocalProcess::ReadStats(const std::string& path, long timeoutSeconds) {
     std::string body, error;
     ServerStats stats;
-    if (!Control("GET", "/_control/stats", &body)) return stats;
+    if (!Control("GET", path, &body, timeoutSeconds)) return stats;
     const auto json = ParseJson(body, error);
     if (!json) return stats;
+    stats.answered = true;
     stats.requests = Number(*json, "requests");
     stats.messages = Number(*json, "messages");
     stats.rows = Number(*json, "rows");
@@ -183,6 +192,10 @@ ServerStats AzureLocalProcess::Stats() {
     stats.proxied = Number(*json, "proxied");
     stats.unauthorized = Number(*json, "unauthorized");
     stats.tooLarge = Number(*json, "tooLarge");
+    stats.latencyRows = Number(*json, "latencyRows");
+    for (auto [name, field] : {std::pair{"latencyP50Ms", &stats.latencyP50Ms}, std::pair{"latencyP99Ms", &stats.latencyP99Ms}}) {
+        if (const JsonValue* v = json->Find(name)) *field = static_cast<std::int64_t>(v->AsDouble().value_or(-1));
+    }
     return stats;
 }
 

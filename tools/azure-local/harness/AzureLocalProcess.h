@@ -25,6 +25,10 @@ struct ReceivedRow {
 struct ServerStats {
     std::uint64_t requests = 0, messages = 0, rows = 0, rejected = 0, bytes = 0, proxied = 0, unauthorized = 0,
                   tooLarge = 0;
+    // Arrival minus row time of the decoded rows, in ms; -1 when none was decoded.
+    std::int64_t latencyP50Ms = -1, latencyP99Ms = -1;
+    std::uint64_t latencyRows = 0;
+    bool answered = false;  // false: the receiver could not be asked
 };
 
 class AzureLocalProcess {
@@ -45,11 +49,15 @@ public:
     // Largest body accepted; kind "service-bus" or "event-hub" sets one of them, empty both.
     bool SetLimit(std::size_t bytes, const std::string& kind = "");
     ServerStats Stats();
+    // The stats once `rows` rows have arrived, or after timeoutMs.
+    ServerStats WaitForRows(std::uint64_t rows, int timeoutMs);
     std::vector<ReceivedRow> Rows();
 
 private:
     AzureLocalProcess() = default;
-    bool Control(const std::string& method, const std::string& path, std::string* body = nullptr);
+    bool Control(const std::string& method, const std::string& path, std::string* body = nullptr,
+                 long timeoutSeconds = 10);
+    ServerStats ReadStats(const std::string& path, long timeoutSeconds);
 
     bool Spawn(const std::vector<std::string>& arguments, std::string& error);
     bool ReadFirstLine(std::string& line, int timeoutMs);

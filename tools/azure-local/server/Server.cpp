@@ -8,8 +8,10 @@
 #include <QSslServer>
 #include <QSslSocket>
 #include <QTcpSocket>
+#include <QTimer>
 #include <QUrlQuery>
 
+#include <algorithm>
 #include <cstdio>
 
 #include "RowDecoders.h"
@@ -78,6 +80,32 @@ std::string FormatOf(const HttpRequest& request) {
     return {};
 }
 
+// Rows of a body without decoding it. Exact for bodies as the client writes
+// them: a quote or "<" inside a text is escaped, so the row openings below
+// appear nowhere else. Empty when the body is not of that format.
+std::optional<quint64> CountRows(const std::string& formatAnyCase, const QByteArray& body) {
+    const std::string format = QByteArray::fromStdString(formatAnyCase).toUpper().toStdString();
+    const std::string_view text(body.constData(), static_cast<std::size_t>(body.size()));
+    auto occurrences = [&text](std::string_view opening) {
+        quint64 count = 0;
+        for (std::size_t at = text.find(opening); at != std::string_view::npos; at = text.find(opening, at + 1)) ++count;
+        return count;
+    };
+    if (format == "JSON" && text.starts_with('[')) return occurrences("{\"project\":");
+    if (format == "XML" && text.starts_with("<?xml")) return occurrences("<row ");
+    if (format == "BOND" && text.size() > 6 && text.starts_with("CB\x01")) {
+        // The list's element count follows the marshal header and the list's type bytes.
+        quint64 count = 0;
+        for (std::size_t at = 6, shift = 0; at < text.size() && shift < 64; ++at, shift += 7) {
+            count |= static_cast<quint64>(static_cast<unsigned char>(text[at]) & 0x7F) << shift;
+            if (!(static_cast<unsigned char>(text[at]) & 0x80)) return count;
+        }
+    }
+    return std::nullopt;
+}
+
+constexpr std::size_t kLatencyBuckets = 60001;  // 0 to 60 s by the millisecond, then "longer"
+
 }  // namespace
 
 Server::Server(ServerConfig config, QObject* parent)
@@ -139,6 +167,7 @@ void Server::OnNewConnection() {
         connect(socket, &QTcpSocket::readyRead, this, [this, socket] { OnReadyRead(socket); });
         connect(socket, &QTcpSocket::disconnected, this, [this, socket] {
             m_states.remove(socket);
+            m_waiters.remove(socket);
             socket->deleteLater();
         });
         if (socket->bytesAvailable() > 0) OnReadyRead(socket);
@@ -227,6 +256,10 @@ void Server::Handle(QTcpSocket* socket, const HttpRequest& request) {
     const QByteArray path = queryStart < 0 ? target : target.left(queryStart);
     const QByteArray query = queryStart < 0 ? QByteArray() : target.mid(queryStart + 1);
 
+    if (path == "/_control/wait") {
+        Wait(socket, query);
+        return;
+    }
     if (path.startsWith("/_control/")) {
         Write(socket, HandleControl(request, path, query), false);
         return;
@@ -260,6 +293,7 @@ void Server::Handle(QTcpSocket* socket, const HttpRequest& request) {
     const HttpReply reply = HandleSend(request, path, query, authority);
     if (reply.status >= 300) ++m_counters.rejected;
     Write(socket, reply, false);
+    if (reply.status < 300) AnswerWaiters();
 }
 
 std::optional<Fault> Server::TakeFault(const HttpRequest& request) {
@@ -277,7 +311,7 @@ std::optional<Fault> Server::TakeFault(const HttpRequest& request) {
 
 HttpReply Server::FaultReply(const Fault& fault, const HttpRequest& request) const {
     const QByteArray authorization = request.headers.value("authorization");
-    QByteArray detail = "injected fault";
+    QByteArray detail = fault.detail.isEmpty() ? QByteArray("injected fault") : fault.detail;
     if (fault.kind == Fault::Kind::EchoAuthorization) {
         detail = "token " + authorization;
     } else if (fault.kind == Fault::Kind::EchoSignature) {
@@ -317,6 +351,17 @@ HttpReply Server::HandleSend(const HttpRequest& request, const QByteArray& path,
                                    " bytes is too large; the limit is " + QByteArray::number(limit) + ".");
     }
     const std::string format = FormatOf(request);
+    if (m_config.countOnly) {
+        const std::optional<quint64> rows = CountRows(format, request.body);
+        if (!rows) return ErrorReply(400, "the body is no " + QByteArray::fromStdString(format) + " list of rows");
+        const QByteArray announced = request.headers.value("rowcount");
+        if (!announced.isEmpty() && announced.toULongLong() != *rows)
+            return ErrorReply(400, "RowCount says " + announced + ", the body holds " + QByteArray::number(*rows));
+        ++m_counters.messages;
+        m_counters.rows += *rows;
+        m_counters.bytes += static_cast<quint64>(request.body.size());
+        return HttpReply{};
+    }
     const DecodeResult decoded =
         DecodeRows(format, std::string_view(request.body.constData(), static_cast<std::size_t>(request.body.size())));
     if (!decoded.ok) return ErrorReply(400, QByteArray::fromStdString(decoded.error));
@@ -330,6 +375,7 @@ HttpReply Server::HandleSend(const HttpRequest& request, const QByteArray& path,
     lines.reserve(decoded.rows.size());
     for (const DecodedRow& row : decoded.rows) lines.push_back(RowToJsonLine(row, entity.toStdString(), format, messageId));
     Record(lines);
+    NoteLatencies(decoded.rows);
     ++m_counters.messages;
     m_counters.rows += decoded.rows.size();
     m_counters.bytes += static_cast<quint64>(request.body.size());
@@ -340,18 +386,7 @@ HttpReply Server::HandleSend(const HttpRequest& request, const QByteArray& path,
 
 HttpReply Server::HandleControl(const HttpRequest& request, const QByteArray& path, const QByteArray& query) {
     const QUrlQuery q(QString::fromUtf8(query));
-    if (path == "/_control/stats") {
-        const auto& c = m_counters;
-        const QByteArray body = "{\"requests\":" + QByteArray::number(c.requests) +
-                                ",\"messages\":" + QByteArray::number(c.messages) +
-                                ",\"rows\":" + QByteArray::number(c.rows) +
-                                ",\"rejected\":" + QByteArray::number(c.rejected) +
-                                ",\"bytes\":" + QByteArray::number(c.bytes) +
-                                ",\"proxied\":" + QByteArray::number(c.proxied) +
-                                ",\"unauthorized\":" + QByteArray::number(c.unauthorized) +
-                                ",\"tooLarge\":" + QByteArray::number(c.tooLarge) + "}";
-        return TextReply("application/json", body);
-    }
+    if (path == "/_control/stats") return TextReply("application/json", StatsBody());
     if (path == "/_control/rows") {
         QByteArray body;
         for (const auto& line : m_rows) body += QByteArray::fromStdString(line) + '\n';
@@ -361,6 +396,7 @@ HttpReply Server::HandleControl(const HttpRequest& request, const QByteArray& pa
     if (path == "/_control/reset") {
         m_counters = Counters{};
         m_rows.clear();
+        m_latencyMs.clear();
         m_faults.clear();
         m_config.serviceBusLimit = m_startServiceBusLimit;
         m_config.eventHubLimit = m_startEventHubLimit;
@@ -394,6 +430,7 @@ HttpReply Server::HandleControl(const HttpRequest& request, const QByteArray& pa
         if (q.hasQueryItem("at")) fault.skip = q.queryItemValue("at").toInt(&ok) - 1;
         if (!ok || fault.skip < 0) return ErrorReply(400, "at is a positive number");
         fault.match = q.queryItemValue("match", QUrl::FullyDecoded).toUtf8();
+        fault.detail = q.queryItemValue("detail", QUrl::FullyDecoded).toUtf8();
         fault.retryAfter = q.queryItemValue("retry-after").toUtf8();
         fault.retryAfterMs = q.queryItemValue("retry-after-ms").toUtf8();
         m_faults.push_back(fault);
@@ -426,6 +463,73 @@ void Server::Record(const std::vector<std::string>& lines) {
             m_recordFile.write("\n", 1);
         }
         m_recordFile.flush();
+    }
+}
+
+QByteArray Server::StatsBody() const {
+    const auto& c = m_counters;
+    QByteArray body = "{\"requests\":" + QByteArray::number(c.requests) + ",\"messages\":" + QByteArray::number(c.messages) +
+                      ",\"rows\":" + QByteArray::number(c.rows) + ",\"rejected\":" + QByteArray::number(c.rejected) +
+                      ",\"bytes\":" + QByteArray::number(c.bytes) + ",\"proxied\":" + QByteArray::number(c.proxied) +
+                      ",\"unauthorized\":" + QByteArray::number(c.unauthorized) +
+                      ",\"tooLarge\":" + QByteArray::number(c.tooLarge);
+    // Percentiles of the decoded rows' latency, in whole milliseconds (-1: none decoded).
+    quint64 total = 0;
+    for (const quint64 n : m_latencyMs) total += n;
+    for (const auto& [name, share] : {std::pair{"latencyP50Ms", 0.50}, std::pair{"latencyP99Ms", 0.99}}) {
+        qint64 value = -1;
+        quint64 seen = 0;
+        for (std::size_t ms = 0; total > 0 && ms < m_latencyMs.size(); ++ms) {
+            seen += m_latencyMs[ms];
+            if (static_cast<double>(seen) >= share * static_cast<double>(total)) {
+                value = static_cast<qint64>(ms);
+                break;
+            }
+        }
+        body += ",\"" + QByteArray(name) + "\":" + QByteArray::number(value);
+    }
+    return body + ",\"latencyRows\":" + QByteArray::number(total) + "}";
+}
+
+void Server::NoteLatencies(const std::vector<DecodedRow>& rows) {
+    if (m_latencyMs.empty()) m_latencyMs.assign(kLatencyBuckets, 0);
+    const qint64 now = QDateTime::currentMSecsSinceEpoch();
+    for (const DecodedRow& row : rows) {
+        // A row stamped after its arrival (clock steps) counts as 0 ms.
+        const qint64 latency = std::max<qint64>(0, now - (row.time * 1000 + row.milliseconds));
+        ++m_latencyMs[static_cast<std::size_t>(std::min<qint64>(latency, kLatencyBuckets - 1))];
+    }
+}
+
+void Server::Wait(QTcpSocket* socket, const QByteArray& query) {
+    const QUrlQuery q(QString::fromUtf8(query));
+    bool rowsOk = false, timeOk = false;
+    const quint64 rows = q.queryItemValue("rows").toULongLong(&rowsOk);
+    const int timeoutMs = q.queryItemValue("timeout-ms").toInt(&timeOk);
+    if (!rowsOk || !timeOk || timeoutMs < 0 || timeoutMs > 600000) {
+        Write(socket, ErrorReply(400, "wait?rows=N&timeout-ms=T (T up to 600000)"), false);
+        return;
+    }
+    if (m_counters.rows >= rows) {
+        Write(socket, TextReply("application/json", StatsBody()), false);
+        return;
+    }
+    m_waiters.insert(socket, rows);
+    // The socket is the timer's context: a connection that closes takes its timer with it.
+    QTimer::singleShot(timeoutMs, socket, [this, socket] {
+        if (m_waiters.remove(socket) > 0) Write(socket, TextReply("application/json", StatsBody()), false);
+    });
+}
+
+void Server::AnswerWaiters() {
+    for (auto it = m_waiters.begin(); it != m_waiters.end();) {
+        if (m_counters.rows < it.value()) {
+            ++it;
+            continue;
+        }
+        QTcpSocket* socket = it.key();
+        it = m_waiters.erase(it);
+        Write(socket, TextReply("application/json", StatsBody()), false);
     }
 }
 

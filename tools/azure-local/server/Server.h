@@ -19,6 +19,8 @@
 #include <string>
 #include <vector>
 
+#include "RowDecoders.h"
+
 class QTcpSocket;
 
 namespace azurelocal {
@@ -36,6 +38,9 @@ struct ServerConfig {
     QString tlsCertificate;
     QString tlsKey;
     QString proxyCredentials;  // "user:password": answer requests in proxy form only with them
+    // Checks signature, entity, size and the rows' count, and counts, but
+    // neither decodes nor records (the receiver of the benchmarks).
+    bool countOnly = false;
 };
 
 struct HttpRequest {
@@ -63,6 +68,7 @@ struct Fault {
     int remaining = 1;
     int skip = 0;             // requests to let through first (at=N: the Nth request from now)
     QByteArray match;         // applies only to requests whose body holds this text
+    QByteArray detail;        // the error text of a status fault; empty: "injected fault"
 };
 
 class Server : public QObject {
@@ -91,6 +97,13 @@ private:
     HttpReply FaultReply(const Fault& fault, const HttpRequest& request) const;
     void Write(QTcpSocket* socket, const HttpReply& reply, bool close);
     void Record(const std::vector<std::string>& lines);
+    // GET /_control/wait?rows=N&timeout-ms=T: the stats once N rows have
+    // arrived, or at the time-out, whichever comes first.
+    void Wait(QTcpSocket* socket, const QByteArray& query);
+    void AnswerWaiters();
+    QByteArray StatsBody() const;
+    // Arrival time minus each row's time stamp, for the latency percentiles.
+    void NoteLatencies(const std::vector<DecodedRow>& rows);
 
     ServerConfig m_config;
     qint64 m_startServiceBusLimit = 0;  // limits restored by a reset
@@ -100,6 +113,8 @@ private:
     QFile m_recordFile;
     std::deque<Fault> m_faults;
     std::deque<std::string> m_rows;  // the last keepRows rows as JSON lines
+    QHash<QTcpSocket*, quint64> m_waiters;  // connections waiting for this many rows
+    std::vector<quint64> m_latencyMs;  // rows by whole milliseconds of latency; the last counts the rest
     struct Counters {
         quint64 requests = 0, messages = 0, rows = 0, rejected = 0, bytes = 0, proxied = 0, unauthorized = 0,
                 tooLarge = 0;

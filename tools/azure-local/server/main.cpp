@@ -17,10 +17,11 @@ int main(int argc, char** argv) {
     QCommandLineParser parser;
     parser.setApplicationDescription(
         "Loopback receiver for the Azure Service Bus and Event Hubs send endpoints.\n"
-        "Control: GET /_control/stats, GET /_control/rows, POST /_control/reset,\n"
+        "Control: GET /_control/stats, GET /_control/rows, GET /_control/wait?rows=N&timeout-ms=T,\n"
+        "POST /_control/reset,\n"
         "POST /_control/limit?bytes=N[&kind=service-bus|event-hub],\n"
         "POST /_control/fault?kind=status|stall|close|echo-auth|echo-signature"
-        "&status=N&count=N&at=N&match=TEXT&retry-after=S&retry-after-ms=MS");
+        "&status=N&count=N&at=N&match=TEXT&detail=TEXT&retry-after=S&retry-after-ms=MS");
     parser.addHelpOption();
     parser.addOptions({
         {"port", "Port to listen on (0: a free one).", "n", "0"},
@@ -36,6 +37,7 @@ int main(int argc, char** argv) {
         {"tls-key", "PEM RSA key of the certificate.", "file"},
         {"proxy-auth", "Require these proxy credentials (user:password) on proxy-form requests.", "credentials"},
         {"quit-on-eof", "End when standard input closes (the parent has gone)."},
+        {"count-only", "Check and count rows without decoding or recording them (for benchmarks)."},
     });
     parser.process(app);
 
@@ -75,6 +77,11 @@ int main(int argc, char** argv) {
     config.tlsCertificate = parser.value("tls-cert");
     config.tlsKey = parser.value("tls-key");
     config.proxyCredentials = parser.value("proxy-auth");
+    config.countOnly = parser.isSet("count-only");
+    if (config.countOnly && !config.recordPath.isEmpty()) {
+        std::cerr << "azure-local: --count-only records nothing; leave out --record\n";
+        return 2;
+    }
     if (config.tlsCertificate.isEmpty() != config.tlsKey.isEmpty()) {
         std::cerr << "azure-local: --tls-cert and --tls-key go together\n";
         return 2;
