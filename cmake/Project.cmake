@@ -29,7 +29,10 @@ function(skyvane_warnings target)
   target_compile_options(${target} PRIVATE -Wall -Wextra -Wpedantic -Werror)
 endfunction()
 
-# A shared library of ours: warnings, hidden symbols by default (exports are marked).
+# A shared library of ours with warnings. Its symbols stay visible: programs and
+# the other libraries link it directly. The two libraries loaded at run time
+# hide everything but their entry points in their own set-up (libCorvell.so by
+# visibility, libSkyvane.so by a version script as well).
 function(skyvane_library target)
   add_library(${target} SHARED ${ARGN})
   skyvane_warnings(${target})

@@ -3,7 +3,7 @@
 // back the same from its canonical form; the masked text holds no secret
 // value where the parser would find one, and keeps every other part.
 
-#include "ConnectionString.h"
+#include "private/ConnectionString.h"
 #include "cloud/ConnectionText.h"
 
 #include "FuzzCheck.h"

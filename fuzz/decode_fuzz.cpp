@@ -5,9 +5,9 @@
 // encoder writes it again and after a round through a recorded row line.
 
 #include "RowDecoders.h"
-#include "RowFormats.h"
-#include "Sas.h"
-#include "Utf.h"
+#include "private/RowFormats.h"
+#include "private/Sas.h"
+#include "private/Utf.h"
 
 #include "FuzzCheck.h"
 

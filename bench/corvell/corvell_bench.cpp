@@ -13,9 +13,9 @@
 #include <memory>
 #include <string>
 
-#include "AzureClient.h"
+#include "private/AzureClient.h"
 #include "AzureLocalProcess.h"
-#include "RowFormats.h"
+#include "private/RowFormats.h"
 
 using namespace corvell;
 

@@ -9,8 +9,8 @@
 #include "E2eRuns.h"
 
 #include "AzureLocalProcess.h"
-#include "RowFormats.h"
-#include "Sas.h"
+#include "private/RowFormats.h"
+#include "private/Sas.h"
 #include "corvell/AzureInstance.h"
 
 #include <QCoreApplication>

@@ -1,4 +1,4 @@
-#include "AzureClient.h"
+#include "private/AzureClient.h"
 
 #include <openssl/crypto.h>
 
@@ -8,8 +8,8 @@
 #include <deque>
 #include <thread>
 
-#include "Sas.h"
-#include "Utf.h"
+#include "private/Sas.h"
+#include "private/Utf.h"
 
 namespace corvell {
 

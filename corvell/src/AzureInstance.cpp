@@ -7,8 +7,8 @@
 #include <exception>
 #include <new>
 
-#include "AzureClient.h"
-#include "Utf.h"
+#include "private/AzureClient.h"
+#include "private/Utf.h"
 
 namespace corvell {
 

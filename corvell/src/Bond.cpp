@@ -1,4 +1,4 @@
-#include "Bond.h"
+#include "private/Bond.h"
 
 #include <cstring>
 

@@ -1,10 +1,10 @@
-#include "ConnectionString.h"
+#include "private/ConnectionString.h"
 
 #include <algorithm>
 #include <cctype>
 #include <charconv>
 
-#include "Utf.h"
+#include "private/Utf.h"
 
 namespace corvell {
 

@@ -1,4 +1,4 @@
-#include "Http.h"
+#include "private/Http.h"
 
 #include <curl/curl.h>
 #include <openssl/crypto.h>

@@ -1,10 +1,10 @@
-#include "Log.h"
+#include "private/Log.h"
 
 #include <algorithm>
 #include <cctype>
 
-#include "Sas.h"
-#include "Utf.h"
+#include "private/Sas.h"
+#include "private/Utf.h"
 
 namespace corvell {
 

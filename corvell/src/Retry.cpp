@@ -1,4 +1,4 @@
-#include "Retry.h"
+#include "private/Retry.h"
 
 #include <curl/curl.h>
 

@@ -1,7 +1,7 @@
-#include "RowFormats.h"
+#include "private/RowFormats.h"
 
-#include "Bond.h"
-#include "Utf.h"
+#include "private/Bond.h"
+#include "private/Utf.h"
 
 #include <charconv>
 #include <cmath>

@@ -1,4 +1,4 @@
-#include "Sas.h"
+#include "private/Sas.h"
 
 #include <openssl/evp.h>
 #include <openssl/hmac.h>

@@ -1,4 +1,4 @@
-#include "Utf.h"
+#include "private/Utf.h"
 
 namespace corvell {
 

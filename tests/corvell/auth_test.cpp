@@ -2,13 +2,13 @@
 
 #include <gtest/gtest.h>
 
-#include "ConnectionString.h"
-#include "Log.h"
+#include "private/ConnectionString.h"
+#include "private/Log.h"
 #include "RecordingLogger.h"
-#include "Retry.h"
+#include "private/Retry.h"
 #include "RowDecoders.h"
-#include "Sas.h"
-#include "Utf.h"
+#include "private/Sas.h"
+#include "private/Utf.h"
 
 using namespace corvell;
 

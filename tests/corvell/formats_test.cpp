@@ -10,9 +10,9 @@
 #include <cmath>
 #include <limits>
 
-#include "Bond.h"
+#include "private/Bond.h"
 #include "RowDecoders.h"
-#include "RowFormats.h"
+#include "private/RowFormats.h"
 
 using namespace corvell;
 

@@ -14,10 +14,10 @@
 #include <cstdio>
 #include <set>
 
-#include "AzureClient.h"
+#include "private/AzureClient.h"
 #include "AzureLocalProcess.h"
 #include "RecordingLogger.h"
-#include "Sas.h"
+#include "private/Sas.h"
 
 using namespace corvell;
 using azurelocal::AzureLocalProcess;

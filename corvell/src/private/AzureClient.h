@@ -9,11 +9,11 @@
 #include <optional>
 #include <string>
 
-#include "ConnectionString.h"
-#include "Http.h"
-#include "Log.h"
-#include "Retry.h"
-#include "RowFormats.h"
+#include "private/ConnectionString.h"
+#include "private/Http.h"
+#include "private/Log.h"
+#include "private/Retry.h"
+#include "private/RowFormats.h"
 
 namespace corvell {
 

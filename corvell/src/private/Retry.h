@@ -6,7 +6,7 @@
 #include <random>
 #include <string>
 
-#include "Http.h"
+#include "private/Http.h"
 
 namespace corvell {
 
