@@ -4,6 +4,8 @@
 #include "frame/MainAzureAccess.h"
 #include "runtime/OnlProject.h"
 
+#include <memory>
+
 namespace {
 
 constexpr DWORD kProjectTimeoutMs = 2000;  // how long an event waits for the timer to take over a project switch
@@ -25,10 +27,10 @@ void CAzureValueExchangeViaCOM::ProcessAllProjects() {
 
 bool CAzureValueExchangeViaCOM::AddVariable(CVarItem* pItem) {
     if (!m_pLink || !pItem) return false;
-    auto** cell = new CVarItem*(pItem);
-    if (m_pLink->AddVariable(pItem->m_strName, cell)) return true;
-    delete cell;
-    return false;
+    auto cell = std::make_unique<CVarItem*>(pItem);
+    if (!m_pLink->AddVariable(pItem->m_strName, cell.get())) return false;
+    cell.release();  // the link owns the cell now
+    return true;
 }
 
 bool CAzureValueExchangeViaCOM::StartLink() { return m_pLink && m_pLink->Start(); }

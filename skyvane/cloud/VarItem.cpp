@@ -67,30 +67,6 @@ bool LocalTimeToSeconds(const SYSTEMTIME& st, LONGLONG& seconds) {
 
 }  // namespace
 
-CVarItemRtData::CVarItemRtData(const CVarItemRtData& other)
-    : CObject(),
-      m_strValue(other.m_strValue),
-      m_dValue(other.m_dValue),
-      m_dwStatusLow(other.m_dwStatusLow),
-      m_dwStatusHigh(other.m_dwStatusHigh),
-      m_bIsString(other.m_bIsString),
-      m_bValid(other.m_bValid),
-      m_time(other.m_time),
-      m_wMilliseconds(other.m_wMilliseconds) {}
-
-CVarItemRtData& CVarItemRtData::operator=(const CVarItemRtData& other) {
-    if (this == &other) return *this;
-    m_strValue = other.m_strValue;
-    m_dValue = other.m_dValue;
-    m_dwStatusLow = other.m_dwStatusLow;
-    m_dwStatusHigh = other.m_dwStatusHigh;
-    m_bIsString = other.m_bIsString;
-    m_bValid = other.m_bValid;
-    m_time = other.m_time;
-    m_wMilliseconds = other.m_wMilliseconds;
-    return *this;
-}
-
 bool CVarItemRtData::ConvertValue(const VARIANT* value, CString& text, double& number, bool& isText) {
     isText = value && (value->vt == VT_BSTR || value->vt == (VT_BSTR | VT_BYREF));
     if (isText) {

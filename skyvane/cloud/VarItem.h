@@ -8,13 +8,32 @@
 #include "platform/sync.h"
 #include "platform/text.h"
 
-class CVarItemRtData : public CObject {
+#include <memory>
+
+// What the runtime last reported for a variable: a plain value, copied whole.
+struct SVarItemValue {
+    CString m_strValue;     // the value of a text variable, else empty
+    double m_dValue = 0.0;  // the value of any other variable, 0.0 for text
+    DWORD m_dwStatusLow = 0;
+    DWORD m_dwStatusHigh = 0;
+    bool m_bIsString = false;
+    bool m_bValid = false;     // a value has been stored at least once
+    LONGLONG m_time = 0;       // seconds since 1970-01-01 00:00 UTC
+    WORD m_wMilliseconds = 0;  // 0 to 999, not folded into m_time
+
+    bool operator==(const SVarItemValue& other) const = default;
+};
+
+class CVarItemRtData : public CObject, public SVarItemValue {
 public:
     CVarItemRtData() = default;
-    // Copies every field but the lock (each object has its own); neither
+    // The value is copied, the lock is not (each object has its own); neither
     // takes the source's lock.
-    CVarItemRtData(const CVarItemRtData& other);
-    CVarItemRtData& operator=(const CVarItemRtData& other);
+    CVarItemRtData(const CVarItemRtData& other) : CObject(), SVarItemValue(other) {}
+    CVarItemRtData& operator=(const CVarItemRtData& other) {
+        SVarItemValue::operator=(other);
+        return *this;
+    }
     ~CVarItemRtData() override = default;
 
     // Stores a reported value when it is a change: other text (letter case
@@ -37,29 +56,22 @@ public:
     bool SetValue(const CString& text, double number, bool isText, DWORD statusLow, DWORD statusHigh,
                   const DATE* time);
 
-    CCriticalSection m_cs;  // guards every field below
-    CString m_strValue;     // the value of a text variable, else empty
-    double m_dValue = 0.0;  // the value of any other variable, 0.0 for text
-    DWORD m_dwStatusLow = 0;
-    DWORD m_dwStatusHigh = 0;
-    bool m_bIsString = false;
-    bool m_bValid = false;       // a value has been stored at least once
-    LONGLONG m_time = 0;         // seconds since 1970-01-01 00:00 UTC
-    WORD m_wMilliseconds = 0;    // 0 to 999, not folded into m_time
+    CCriticalSection m_cs;  // guards every field of the value
 };
 
 class CVarItem : public CObject {
 public:
-    CVarItem() : m_pRtData(new CVarItemRtData) {}
+    CVarItem() : m_pRtData(std::make_unique<CVarItemRtData>()) {}
     // Same key, a separate copy of the runtime data.
-    CVarItem(const CVarItem& other) : m_pRtData(new CVarItemRtData(*other.m_pRtData)), m_strName(other.m_strName) {}
+    CVarItem(const CVarItem& other)
+        : m_pRtData(std::make_unique<CVarItemRtData>(*other.m_pRtData)), m_strName(other.m_strName) {}
     CVarItem& operator=(const CVarItem&) = delete;
-    ~CVarItem() override { delete m_pRtData; }
+    ~CVarItem() override = default;
 
     // Splits a variable key at its first "#" into project and variable name;
     // a key without "#" has an empty project.
     static void SplitKey(const CString& key, CString& project, CString& variable);
 
-    CVarItemRtData* const m_pRtData;  // owned, never null
+    const std::unique_ptr<CVarItemRtData> m_pRtData;  // never null
     CString m_strName;                // the variable key: project "#" variable
 };

@@ -20,16 +20,15 @@ int FormatCode(int nFormat) { return nFormat >= 0 && nFormat <= 2 ? nFormat : 0;
 void CMainSkyvane::QueueValueChange(CVarItem* item) {
     if (!item) return;
     // The snapshot is made before the lock; the worker waits only for the append.
-    auto* snapshot = new CVarItem(*item);
+    auto snapshot = std::make_unique<CVarItem>(*item);
     {
         CSingleLock lock(&m_csQueue, true);
         if (m_lstValueQueue.GetCount() <= m_nQueueLimit) {
-            m_lstValueQueue.AddTail(snapshot);
+            m_lstValueQueue.AddTail(snapshot.release());  // the queue owns its items
             m_nQueued.store(m_lstValueQueue.GetCount(), std::memory_order_release);
             return;
         }
     }
-    delete snapshot;
     LogError(CString::Formatted(u"Value change queue full: Value change for %s is lost!", item->m_strName));
 }
 
@@ -123,7 +122,7 @@ void CMainSkyvane::AddRows(CAzureComm& comm, const CLstOwner<CVarItem>& batch, b
     if (!integrity) return;
     for (const auto& [key, item] : m_config.m_mapVariables) {
         // A snapshot under the item's lock; the row is added after it is released.
-        CVarItemRtData current;
+        SVarItemValue current;
         {
             CSingleLock lock(&item->m_pRtData->m_cs, true);
             current = *item->m_pRtData;
@@ -145,7 +144,7 @@ int CMainSkyvane::CountRows(const CLstOwner<CVarItem>& batch, bool integrity) co
 }
 
 // Rows only for values the runtime has reported; others are not counted.
-void CMainSkyvane::AddRow(CAzureComm& comm, const CString& key, const CVarItemRtData& data, RowCounts& counts) {
+void CMainSkyvane::AddRow(CAzureComm& comm, const CString& key, const SVarItemValue& data, RowCounts& counts) {
     if (!data.m_bValid) return;
     const bool added = comm.AddOnlineRow(key, data.m_dValue, data.m_strValue, data.m_bIsString, data.m_time,
                                          data.m_wMilliseconds, data.m_dwStatusLow, data.m_dwStatusHigh);

@@ -82,7 +82,7 @@ private:
                           bool integrity, RowCounts& cycle);
     void AddRows(CAzureComm& comm, const CLstOwner<CVarItem>& batch, bool integrity, RowCounts& counts);
     int CountRows(const CLstOwner<CVarItem>& batch, bool integrity) const;
-    static void AddRow(CAzureComm& comm, const CString& key, const CVarItemRtData& data, RowCounts& counts);
+    static void AddRow(CAzureComm& comm, const CString& key, const SVarItemValue& data, RowCounts& counts);
 
     CAzureConfig m_config;  // written on the window thread only while the worker is stopped
     int m_nTickState = kTickIdle;  // window thread only

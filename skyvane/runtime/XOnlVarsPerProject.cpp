@@ -6,6 +6,8 @@
 #include "platform/ticks.h"
 #include "tarvo/TarvoIds.h"
 
+#include <memory>
+
 namespace {
 
 // A copy that owns its value: a by-reference value (which points into the
@@ -108,7 +110,7 @@ void CXOnlVarsPerProject::CreateVariables() { m_pVariables = VX_CreateCounted<CO
 
 void CXOnlVarsPerProject::OnVariableChange(double dId, const VARIANT* pValue, double dStatusLow, double dStatusHigh,
                                            double dTime, CVarItem** ppHolder) {
-    auto* record = new STarvoVarValue;
+    auto record = std::make_unique<STarvoVarValue>();
     DWORD low = 0, high = 0;
     TruncatedLow32(dId, &record->dwId);
     TruncatedLow32(dStatusLow, &low);
@@ -119,16 +121,13 @@ void CXOnlVarsPerProject::OnVariableChange(double dId, const VARIANT* pValue, do
     record->ppHolder = ppHolder;
 
     CSingleLock lock(&m_mutex);
-    if (!lock.Lock(m_dwTimeout)) {
-        delete record;
-        return;
-    }
+    if (!lock.Lock(m_dwTimeout)) return;
     if (m_nQueueLimit == 0 || m_lstValues.GetCount() <= m_nQueueLimit) {
-        m_lstValues.AddTail(record);
+        m_lstValues.AddTail(record.release());  // the queue owns its records
         return;
     }
+    // Still under the queue lock: the design reports a full queue from here.
     m_pNotify->OnValueQueueFull(m_strProject, record->dwId);
-    delete record;
 }
 
 void CXOnlVarsPerProject::OnProjectInactive() {

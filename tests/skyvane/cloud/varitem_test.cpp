@@ -108,7 +108,7 @@ TEST_F(VarItemTest, TimeStamps) {
 
     // A rejected time stores nothing: the item stays exactly as it was, and no change is reported.
     ASSERT_TRUE(Report(3.0, 0, 0, At(kMarch31_2024, 0, 0, 1, 5)));
-    const CVarItemRtData before(data);
+    const SVarItemValue before = data;
     double value = 4.0;
     const DATE rejectedTimes[] = {At(18415.0, 12, 0, 0), At(402134.0, 0, 0, 0), std::nan("")};  // 1950, 3001
     for (const DATE rejected : rejectedTimes) {
@@ -116,13 +116,7 @@ TEST_F(VarItemTest, TimeStamps) {
         VX_CVariant text(u"text");
         EXPECT_FALSE(data.Update(&text, 0, 0, &rejected));
         EXPECT_FALSE(data.Update(&text, 0, 0, nullptr));
-        EXPECT_EQ(data.m_dValue, before.m_dValue);
-        EXPECT_EQ(data.m_strValue, before.m_strValue);
-        EXPECT_EQ(data.m_bIsString, before.m_bIsString);
-        EXPECT_EQ(data.m_dwStatusLow, before.m_dwStatusLow);
-        EXPECT_EQ(data.m_dwStatusHigh, before.m_dwStatusHigh);
-        EXPECT_EQ(data.m_time, before.m_time);
-        EXPECT_EQ(data.m_wMilliseconds, before.m_wMilliseconds);
+        EXPECT_TRUE(static_cast<const SVarItemValue&>(data) == before);
         value += 1.0;
     }
     CVarItemRtData first;  // a first value with a rejected time leaves the item without a value
