@@ -191,7 +191,7 @@ private:
     bool ReadGenerator(const QJsonValue& value, const std::string& where, GeneratorConfig* g) {
         if (!value.isObject()) return Fail(m_error, where + ": must be an object");
         const QJsonObject o = value.toObject();
-        if (!Keys(o, where, {"kind", "period_ms", "amplitude", "offset", "cycle_ms", "step", "min", "max", "texts",
+        if (!Keys(o, where, {"kind", "period_ms", "phase_ms", "amplitude", "offset", "cycle_ms", "step", "min", "max", "texts",
                              "alt_status", "seed"}))
             return false;
         static const std::pair<const char*, GeneratorKind> kinds[] = {
@@ -209,7 +209,8 @@ private:
             }
         }
         if (!known) return Fail(m_error, where + ": unknown \"kind\" \"" + kind.toStdString() + "\"");
-        if (!Unsigned(o, "period_ms", where, &g->periodMs) || !Unsigned(o, "cycle_ms", where, &g->cycleMs) ||
+        if (!Unsigned(o, "period_ms", where, &g->periodMs) || !Unsigned(o, "phase_ms", where, &g->phaseMs) ||
+            !Unsigned(o, "cycle_ms", where, &g->cycleMs) ||
             !Unsigned(o, "seed", where, &g->seed) || !Number(o, "amplitude", where, &g->amplitude) ||
             !Number(o, "offset", where, &g->offset) || !Number(o, "step", where, &g->step) ||
             !Number(o, "min", where, &g->minimum) || !Number(o, "max", where, &g->maximum) ||

@@ -23,7 +23,7 @@ void StartGenerator(VariableState& v) {
     v.number = v.config.number;
     v.time = NowAsOleDate();
     v.random.seed(g.seed + static_cast<std::uint32_t>(v.config.id));
-    v.nextChangeMs = g.periodMs;
+    v.nextChangeMs = static_cast<ULONGLONG>(g.periodMs) + g.phaseMs;
     // A text cycle goes on after the initial text when that is one of its texts.
     const auto it = std::find(g.texts.begin(), g.texts.end(), v.config.text);
     v.textIndex = it == g.texts.end() ? 0 : static_cast<size_t>(it - g.texts.begin()) + 1;

@@ -63,6 +63,14 @@ TEST(ProjectFile, DefaultsAndIds) {
     EXPECT_EQ(p.variables[4].text, u"x");
     EXPECT_EQ(p.variables[4].status, ~0ull);
     EXPECT_EQ(p.variables[1].generator.kind, GeneratorKind::Constant);
+    EXPECT_EQ(p.variables[1].generator.phaseMs, 0u);
+
+    ASSERT_TRUE(tarvo::ParseProjectJson(
+        OneVariable(R"({"name": "a", "generator": {"kind": "counter", "period_ms": 500, "phase_ms": 300}})"), &config,
+        &error))
+        << error;
+    EXPECT_EQ(config.projects[0].variables[0].generator.periodMs, 500u);
+    EXPECT_EQ(config.projects[0].variables[0].generator.phaseMs, 300u);
 }
 
 TEST(ProjectFile, BadFilesAreRejectedWithTheReason) {
@@ -85,6 +93,7 @@ TEST(ProjectFile, BadFilesAreRejectedWithTheReason) {
     ExpectRejected(OneVariable(R"({"name": "a{n}", "repeat": 2, "id": 2147483647})"), "past");
     ExpectRejected(OneVariable(R"({"name": "a", "generator": {"kind": "sinus"}})"), "unknown \"kind\" \"sinus\"");
     ExpectRejected(OneVariable(R"({"name": "a", "generator": {"kind": "sine", "period_ms": 0}})"), "period_ms");
+    ExpectRejected(OneVariable(R"({"name": "a", "generator": {"kind": "sine", "phase_ms": -5}})"), "phase_ms");
     ExpectRejected(OneVariable(R"({"name": "a", "generator": {"kind": "text_cycle", "texts": ["x"]}})"),
                    "needs a text variable");
     ExpectRejected(OneVariable(R"({"name": "a", "type": "text", "generator": {"kind": "text_cycle"}})"),

@@ -2,6 +2,7 @@
 // reach a container, project events, and the threads events come from.
 #include "TarvoClient.h"
 
+#include <algorithm>
 #include <cmath>
 #include <ctime>
 
@@ -272,13 +273,17 @@ TEST(TarvoSimulation, GeneratorsChangeValuesEveryPeriod) {
         v.generator.cycleMs = 400;
     });
     add(u"Slow", tarvo::GeneratorKind::Counter, [](auto& v) { v.generator.periodMs = 200; });
+    add(u"Late", tarvo::GeneratorKind::Counter, [](auto& v) {
+        v.generator.periodMs = 200;
+        v.generator.phaseMs = 100;
+    });
     config.projects = {project};
     tarvo::Runtime sim(config, {tarvo::Delivery::CallerThread, false});
     ASSERT_TRUE(sim.Start());
     auto sink = MakeComObject<RecordingSink>(DIID_IOnlineVariableEvents);
     {
         CComPtr<IDispatch> container =
-            OpenContainer(Project(u"Sim").Get(), u"Gw", {u"Ramp", u"Text", u"Flip", u"Walk", u"Sine", u"Slow"});
+            OpenContainer(Project(u"Sim").Get(), u"Gw", {u"Ramp", u"Text", u"Flip", u"Walk", u"Sine", u"Slow", u"Late"});
         ASSERT_NE(Advise(container.Get(), DIID_IOnlineVariableEvents, sink.Get()), 0u);
     }
     std::vector<BulkChange> ticks;
@@ -288,8 +293,16 @@ TEST(TarvoSimulation, GeneratorsChangeValuesEveryPeriod) {
         ASSERT_EQ(sink->CallCount(), 1u) << "tick " << i;
         ticks.push_back(ReadBulkChange(sink->Calls()[0]));
     }
-    // The first tick carries all six; the slow counter changes at 200, 400 and 600 ms.
-    for (size_t i = 0; i < ticks.size(); ++i) EXPECT_EQ(ticks[i].ids.size(), i == 0 || i % 2 == 1 ? 6u : 5u) << i;
+    // The first tick carries all seven; the slow counter changes at 200, 400 and 600 ms, the
+    // one shifted by its phase at 300 and 500 ms.
+    const double slowId = ticks[0].ids[5], lateId = ticks[0].ids[6];
+    for (size_t i = 0; i < ticks.size(); ++i) {
+        EXPECT_EQ(ticks[i].ids.size(), i == 0 ? 7u : 6u) << i;
+        const bool slow = std::count(ticks[i].ids.begin(), ticks[i].ids.end(), slowId) == 1;
+        const bool late = std::count(ticks[i].ids.begin(), ticks[i].ids.end(), lateId) == 1;
+        EXPECT_EQ(slow, i == 0 || i % 2 == 1) << i;
+        EXPECT_EQ(late, i == 0 || (i > 0 && i % 2 == 0)) << i;
+    }
     std::vector<double> ramp;
     std::vector<std::u16string> texts;
     std::vector<double> highs;
@@ -307,6 +320,7 @@ TEST(TarvoSimulation, GeneratorsChangeValuesEveryPeriod) {
     EXPECT_EQ(highs, (std::vector<double>{256, 0, 256, 0, 256, 0}));
     EXPECT_EQ(ticks[1].values[4].dblVal, 10.0);  // the sine crosses its offset at half the cycle
     EXPECT_EQ(ticks[3].values[5].dblVal, 2.0);   // the slow counter at its second change
+    EXPECT_EQ(ticks[4].values[5].dblVal, 2.0);   // the shifted one at its second change
 }
 
 TEST(TarvoSimulation, ChangesComeFromTheRuntimeThread) {

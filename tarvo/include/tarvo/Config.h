@@ -24,6 +24,7 @@ enum class GeneratorKind {
 struct GeneratorConfig {
     GeneratorKind kind = GeneratorKind::Constant;
     DWORD periodMs = 1000;  // time between two changes, simulated time
+    DWORD phaseMs = 0;      // delays every change by this much, to spread variables of one period over the ticks
     double amplitude = 1.0;
     double offset = 0.0;
     DWORD cycleMs = 60000;  // sine wave length
