@@ -1,9 +1,14 @@
 // tarvo-runtime and tarvo-ctl as programs: a runtime process on a private
-// socket folder, driven and read by the command-line client.
+// socket folder, driven and read by the command-line client; and the children
+// of a test, which end with it.
 #include "runtime_process.h"
 #include "temp_folder.h"
 
 #include <gtest/gtest.h>
+
+#include <sys/syscall.h>
+
+#include <cerrno>
 
 namespace {
 
@@ -52,4 +57,35 @@ TEST(TarvoPrograms, CtlDrivesARuntimeProcess) {
     EXPECT_TRUE(runtime.Stop()) << runtime.Output();
     EXPECT_NE(runtime.Output().find("stopped (SIGTERM)"), std::string::npos);
     EXPECT_EQ(Ctl(sockets, {"projects"}).exitCode, 1);
+}
+
+// A child a test started ends when the test's process dies without cleaning up.
+TEST(TestChildren, EndWhenTheirTestDies) {
+    int report[2];
+    ASSERT_EQ(::pipe2(report, O_CLOEXEC), 0);
+    const pid_t test = ::fork();
+    if (test == 0) {  // the test: starts a child, says which, and dies at once
+        const pid_t child = StartChild({"/bin/sleep", "60"});
+        if (::write(report[1], &child, sizeof child) != static_cast<ssize_t>(sizeof child)) ::_exit(1);
+        ::raise(SIGKILL);
+    }
+    ASSERT_GT(test, 0);
+    ::close(report[1]);
+    pid_t child = -1;
+    const ssize_t n = ::read(report[0], &child, sizeof child);
+    ::close(report[0]);
+    ::waitpid(test, nullptr, 0);
+    ASSERT_EQ(n, static_cast<ssize_t>(sizeof child));
+    ASSERT_GT(child, 0);
+    // The orphan belongs to another parent now; its pid descriptor reports its end.
+    const int pidfd = static_cast<int>(::syscall(SYS_pidfd_open, child, 0));
+    if (pidfd < 0) {
+        EXPECT_EQ(errno, ESRCH) << "neither gone nor observable";
+        return;
+    }
+    pollfd ended{pidfd, POLLIN, 0};
+    const int ready = ::poll(&ended, 1, 10000);
+    ::close(pidfd);
+    EXPECT_EQ(ready, 1) << "the child outlived its test by 10 s";
+    if (ready != 1) ::kill(child, SIGKILL);
 }
