@@ -67,30 +67,20 @@ jq -n --argjson groups "$groups" --argjson per $((variables / groups)) --argjson
     generator: { kind: "counter", period_ms: $period, phase_ms: ($g * 100) } }] }]
 }' > "$work/project.json"
 
-# azure-local as a coprocess: the script holds its standard input, and
-# --quit-on-eof ends it when the script closes it or ends in any way.
-coproc AZURE { exec "$bin/azure-local" --port 0 --keep-rows 1000 --quit-on-eof 2>"$work/azure-local.err"; }
-azure_pid=$AZURE_PID
-azure_in=${AZURE[1]}
+source "$top/scripts/azure-local.sh"
 gateway_pid=
 stop_all() {
   if [[ -n "$gateway_pid" ]]; then
     kill -KILL "$gateway_pid" 2>/dev/null || true
     wait "$gateway_pid" 2>/dev/null || true
   fi
-  if [[ -n "${azure_in:-}" ]]; then
-    exec {azure_in}>&-
-    azure_in=
-  fi
-  wait "$azure_pid" 2>/dev/null || true
+  stop_azure_local
 }
 trap stop_all EXIT
-
-read -r -t 10 -u "${AZURE[0]}" first || { echo "soak: azure-local did not start (see $work/azure-local.err)" >&2; exit 1; }
-[[ "$first" == PORT\ * ]] || { echo "soak: azure-local said '$first' instead of its port" >&2; exit 1; }
-port=${first#PORT }
+start_azure_local "$bin" "$work/azure-local.err" --keep-rows 1000 || exit 1
+port=$azure_port
+connection=$azure_connection
 control="http://127.0.0.1:$port/_control"
-connection="Endpoint=sb://127.0.0.1:$port/;SharedAccessKeyName=RootManageSharedAccessKey;SharedAccessKey=azure-local-key;UseDevelopmentEmulator=true"
 
 {
   printf '[Azure]\nINTEGRITYPERIOD=5\n\n[VARIABLES]\nCOUNT=%d\n' "$variables"
