@@ -70,6 +70,7 @@ public:
     void OnProjectInactiveFailed(const CString&) override {}
     void OnProjectActiveFailed(const CString&) override {}
     void OnValueQueueFull(CString, DWORD id) override { queueFull.push_back(id); }
+    void OnValuesDiscarded(const CString&, int) override {}
 
     std::vector<Change> changes;  // the runtime delivers on the calling thread: no lock needed
     std::vector<DWORD> queueFull;

@@ -1,9 +1,11 @@
 #!/usr/bin/env bash
 # Configures and builds one flavour: release (default), asan (ASan+UBSan) or tsan.
+# Usage: bash scripts/build.sh [FLAVOUR [TARGET...]]   (targets: only those and what they need)
 # Prints the build folder on the last line.
 set -euo pipefail
 top=$(cd "$(dirname "$0")/.." && pwd)
 flavour=${1:-release}
+targets=("${@:2}")
 case "$flavour" in
   release) sanitize="" ;;
   asan)    sanitize=address ;;
@@ -12,5 +14,9 @@ case "$flavour" in
 esac
 build="$top/build/$flavour"
 cmake -S "$top" -B "$build" -DSKYVANE_SANITIZE="$sanitize" >/dev/null
-cmake --build "$build" -j2 >&2
+if ((${#targets[@]})); then
+  cmake --build "$build" -j2 --target "${targets[@]}" >&2
+else
+  cmake --build "$build" -j2 >&2
+fi
 echo "$build"

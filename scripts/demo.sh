@@ -24,25 +24,11 @@ demo="$build/demo"
 rm -rf "$demo"
 mkdir -p "$demo"
 
-# azure-local runs as a coprocess: the demo holds its standard input, and
-# --quit-on-eof ends it when the demo closes it or ends in any way.
-coproc AZURE { exec "$bin/azure-local" --port 0 --record "$demo/rows.jsonl" --quit-on-eof 2>"$demo/azure-local.err"; }
-azure_pid=$AZURE_PID
-azure_in=${AZURE[1]}
-stop_azure() {
-  if [[ -n "${azure_in:-}" ]]; then
-    exec {azure_in}>&-
-    azure_in=
-  fi
-  wait "$azure_pid" 2>/dev/null || true
-}
-trap stop_azure EXIT
-
-read -r -t 10 -u "${AZURE[0]}" first || { echo "demo: azure-local did not start (see $demo/azure-local.err)" >&2; exit 1; }
-[[ "$first" == PORT\ * ]] || { echo "demo: azure-local said '$first' instead of its port" >&2; exit 1; }
-port=${first#PORT }
-# The receiver's own demo key: it exists only on loopback, for this run.
-connection="Endpoint=sb://127.0.0.1:$port/;SharedAccessKeyName=RootManageSharedAccessKey;SharedAccessKey=azure-local-key;UseDevelopmentEmulator=true"
+source "$top/scripts/azure-local.sh"
+trap stop_azure_local EXIT
+start_azure_local "$bin" "$demo/azure-local.err" --record "$demo/rows.jsonl" || exit 1
+port=$azure_port
+connection=$azure_connection
 
 cat > "$demo/settings.ini" <<INI
 [Azure]
@@ -85,7 +71,7 @@ echo
 BRENNIC_CONFIG="$demo/brennic.ini" "$bin/skyvane-gateway" run --ini "$demo/settings.ini" \
   --simulate "$top/tarvo/examples/plant.json" --duration "$duration" --status-interval 5 \
   --metrics-file "$demo/gateway.prom" | tee "$demo/gateway.out"
-stop_azure  # the receiver writes out its record file as it ends
+stop_azure_local  # the receiver writes out its record file as it ends
 
 echo
 echo "demo: what arrived at azure-local"

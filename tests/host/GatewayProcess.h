@@ -6,9 +6,10 @@
 #include <QDir>
 #include <QProcessEnvironment>
 
+#include "child_process.h"
+
 #include <fcntl.h>
 #include <poll.h>
-#include <sys/prctl.h>
 #include <sys/syscall.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -21,8 +22,6 @@
 #include <string>
 #include <vector>
 
-// The child is started with a plain fork and exec rather than QProcess: Qt's
-// clone-based start confuses ThreadSanitizer's view of the test process's locks.
 class GatewayProcess {
 public:
     static std::string BinDir() { return QCoreApplication::applicationDirPath().toStdString(); }
@@ -108,11 +107,6 @@ private:
     }
 
     void Spawn(const std::vector<std::string>& args, const std::vector<std::string>& env, const std::string& folder) {
-        std::vector<char*> argv, envp;
-        for (const std::string& a : args) argv.push_back(const_cast<char*>(a.c_str()));
-        argv.push_back(nullptr);
-        for (const std::string& e : env) envp.push_back(const_cast<char*>(e.c_str()));
-        envp.push_back(nullptr);
         int out[2], err[2];
         if (pipe2(out, O_CLOEXEC) != 0) return;
         if (pipe2(err, O_CLOEXEC) != 0) {
@@ -120,15 +114,7 @@ private:
             ::close(out[1]);
             return;
         }
-        m_pid = fork();
-        if (m_pid == 0) {  // only async-signal-safe calls from here on
-            prctl(PR_SET_PDEATHSIG, SIGKILL);  // never outlive a test that died
-            dup2(out[1], STDOUT_FILENO);
-            dup2(err[1], STDERR_FILENO);
-            if (!folder.empty() && chdir(folder.c_str()) != 0) _exit(126);
-            execve(argv[0], argv.data(), envp.data());
-            _exit(127);
-        }
+        m_pid = StartChild(args, {-1, out[1], err[1]}, &env, folder);
         ::close(out[1]);
         ::close(err[1]);
         m_out = out[0];

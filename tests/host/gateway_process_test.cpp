@@ -7,6 +7,7 @@
 
 #include <cstdlib>
 #include <map>
+#include <sstream>
 #include <string>
 
 namespace {
@@ -32,11 +33,10 @@ std::map<std::string, double> ParseMetrics(const std::string& file, std::string&
         output = "SKYVANE_PYTHON or SKYVANE_SOURCE_DIR is not set";
         return samples;
     }
-    QProcess parser;
-    parser.start(python, {QString(source) + "/tests/host/check_metrics.py", QString::fromStdString(file)});
-    parser.waitForFinished(30000);
-    output = (parser.readAllStandardOutput() + parser.readAllStandardError()).toStdString();
-    if (parser.exitStatus() != QProcess::NormalExit || parser.exitCode() != 0) return {};
+    const ChildResult parser =
+        RunChild({python, std::string(source) + "/tests/host/check_metrics.py", file}, /*withErrors=*/true);
+    output = parser.output;
+    if (parser.exitCode != 0) return {};
     std::istringstream lines(output);
     std::string name, type;
     double value;

@@ -2,11 +2,12 @@
 // A tarvo-runtime child process for tests and benchmarks: started from the
 // folder of the running program, on a socket folder of the caller's, and
 // waited for until it reports that it is ready. Its standard error is
-// collected by a thread of its own (so the child never blocks on it).
+// collected by a thread of its own (so the child never blocks on it). It is
+// killed when the thread that started it ends (see child_process.h).
+
+#include "child_process.h"
 
 #include <fcntl.h>
-#include <spawn.h>
-#include <poll.h>
 #include <signal.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -18,8 +19,6 @@
 #include <string>
 #include <thread>
 #include <vector>
-
-extern char** environ;
 
 class RuntimeProcess {
 public:
@@ -39,20 +38,12 @@ public:
             m_output.clear();
             m_ended = false;
         }
-        std::vector<char*> argv;
-        for (auto& a : args) argv.push_back(a.data());
-        argv.push_back(nullptr);
         int pipeFds[2];
         if (::pipe2(pipeFds, O_CLOEXEC) != 0) return false;
-        posix_spawn_file_actions_t actions;
-        posix_spawn_file_actions_init(&actions);
-        posix_spawn_file_actions_adddup2(&actions, pipeFds[1], 2);
-        const int failed = posix_spawn(&m_pid, program.c_str(), &actions, nullptr, argv.data(), environ);
-        posix_spawn_file_actions_destroy(&actions);
+        m_pid = StartChild(args, {-1, -1, pipeFds[1]});
         ::close(pipeFds[1]);
-        if (failed) {
+        if (m_pid < 0) {
             ::close(pipeFds[0]);
-            m_pid = -1;
             return false;
         }
         m_reader = std::thread([this, fd = pipeFds[0]] { Collect(fd); });

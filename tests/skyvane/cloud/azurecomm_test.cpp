@@ -1,5 +1,6 @@
 // The cloud communication object: loading the Azure library, its instance,
-// the proxy password, and rows through the real library to azure-local.
+// the proxy password, rows through the real library to azure-local, and the
+// library's records in the module's log.
 #include "cloud/AzureComm.h"
 #include "cloud/PasswordKey.h"
 #include "frame/ConfigData.h"
@@ -232,4 +233,28 @@ TEST(AzureCommSend, TheDecipheredPasswordOpensTheProxy) {
     EXPECT_TRUE(comm.SendOnlineRows());
     EXPECT_EQ(server->Rows().size(), 1u);
     EXPECT_GE(server->Stats().proxied, 1u);
+}
+
+// The library's records reach the module's log through the object's logger.
+TEST(AzureCommSend, LibraryRecordsReachTheModuleLog) {
+    TempFolder folder;
+    const std::string logPath = folder.Path("module.log");
+    setenv("BRENNIC_CONFIG",
+           folder.Write("brennic.ini", "[file]\npath = " + logPath + "\n[stderr]\nenabled = no\n[levels]\n0 = 0\n19 = 1\n")
+               .c_str(),
+           1);
+    CMainAccess module;
+    CConfigData context;
+    ASSERT_EQ(module.Init(&context), 1);
+    {
+        CAzureComm comm;
+        ASSERT_TRUE(comm.Init(u"", u"", u""));
+        EXPECT_FALSE(comm.IsInfoEnabled());
+        EXPECT_FALSE(comm.BeginOnlineRows(u"no connection string", u"q", false, 1));
+    }
+    module.DllExit(0);
+    unsetenv("BRENNIC_CONFIG");
+    const auto lines = TempFolder::ReadLines(logPath);
+    ASSERT_EQ(lines.size(), 1u) << lines.back();
+    EXPECT_NE(lines[0].find("PelgradDll ERROR kind=76 field=39: "), std::string::npos) << lines[0];
 }

@@ -1,5 +1,7 @@
 #include "AzureLocalProcess.h"
 
+#include "child_process.h"
+
 #include <QCoreApplication>
 
 #include <curl/curl.h>
@@ -37,14 +39,8 @@ std::uint64_t Number(const JsonValue& object, const char* name) {
 
 std::string BuildBinaryDir() { return QCoreApplication::applicationDirPath().toStdString(); }
 
-// The child is started with a plain fork and exec rather than QProcess: Qt
-// starts children with a clone that shares the parent's memory, and
-// ThreadSanitizer's bookkeeping in such a child corrupts the parent's, so that
-// later locking in the test process went unseen.
+// Started as child_process.h starts every child of a test: fork and exec.
 bool AzureLocalProcess::Spawn(const std::vector<std::string>& arguments, std::string& error) {
-    std::vector<char*> argv;
-    for (const std::string& a : arguments) argv.push_back(const_cast<char*>(a.c_str()));
-    argv.push_back(nullptr);
     int toChild[2], fromChild[2];
     if (pipe2(toChild, O_CLOEXEC) != 0) {
         error = std::string("pipe: ") + std::strerror(errno);
@@ -56,13 +52,7 @@ bool AzureLocalProcess::Spawn(const std::vector<std::string>& arguments, std::st
         close(toChild[1]);
         return false;
     }
-    m_pid = fork();
-    if (m_pid == 0) {  // only async-signal-safe calls from here on
-        dup2(toChild[0], STDIN_FILENO);
-        dup2(fromChild[1], STDOUT_FILENO);
-        execv(argv[0], argv.data());
-        _exit(127);
-    }
+    m_pid = StartChild(arguments, {toChild[0], fromChild[1], -1});
     close(toChild[0]);
     close(fromChild[1]);
     m_stdin = toChild[1];
