@@ -39,7 +39,8 @@ void CheckForm(const CAesCrypt& crypt, std::string_view bytes) {
 void CheckText(const CAesCrypt& crypt, std::string_view bytes, std::size_t damageAt) {
     std::u16string chars;
     for (std::size_t i = 0; i + 1 < bytes.size(); i += 2)
-        chars.push_back(static_cast<char16_t>(static_cast<unsigned char>(bytes[i]) | static_cast<unsigned char>(bytes[i + 1]) << 8));
+        chars.push_back(static_cast<char16_t>(static_cast<unsigned char>(bytes[i]) |
+                                              static_cast<unsigned char>(bytes[i + 1]) << 8));
     const CString plain(chars);
     CString form = plain;
     if (!crypt.EncryptHexString(form)) {
@@ -51,7 +52,8 @@ void CheckText(const CAesCrypt& crypt, std::string_view bytes, std::size_t damag
         return;
     }
     FuzzCheck(IsUpperHex(form), "a form is upper-case hexadecimal");
-    FuzzCheck(form.GetLength() == 2 * (kOverheadBytes + static_cast<int>(plain.ToUtf8().size())), "a form has the expected length");
+    FuzzCheck(form.GetLength() == 2 * (kOverheadBytes + static_cast<int>(plain.ToUtf8().size())),
+              "a form has the expected length");
 
     CString lower = form;
     lower.MakeLower();

@@ -158,7 +158,10 @@ private:
 double EventBuilder::Number() {
     const std::uint8_t kind = m_in.Byte();
     switch (kind % 8) {
-    case 0: case 1: case 2: case 3: return m_ids[(kind / 8) % m_ids.size()];
+    case 0:
+    case 1:
+    case 2:
+    case 3: return m_ids[(kind / 8) % m_ids.size()];
     case 4: return kind / 8;
     case 5: return m_in.Plain<double>();
     case 6: return kind & 8 ? std::nan("") : (kind & 16 ? 1e300 : -HUGE_VAL);
@@ -170,7 +173,8 @@ std::u16string EventBuilder::Text() {
     std::u16string text;
     for (char c : m_in.Text(6)) {
         const auto b = static_cast<unsigned char>(c);
-        text.push_back(b >= 0xF0 ? static_cast<char16_t>(0xD800 + b) : static_cast<char16_t>(b));  // lone surrogates too
+        text.push_back(b >= 0xF0 ? static_cast<char16_t>(0xD800 + b)
+                                 : static_cast<char16_t>(b));  // lone surrogates too
     }
     return text;
 }
@@ -191,16 +195,21 @@ void EventBuilder::PutElement(VARTYPE vt, void* slot, std::optional<double>& num
         value = Value{VT_R8, *number, {}};
     };
     switch (vt) {
-    case VT_R8: case VT_DATE: plain(d, true); break;
+    case VT_R8:
+    case VT_DATE: plain(d, true); break;
     case VT_R4: plain(static_cast<float>(d), true); break;
-    case VT_I4: case VT_INT: plain(Integral<std::int32_t>(d), true); break;
-    case VT_UI4: case VT_UINT: plain(Integral<std::uint32_t>(d), true); break;
+    case VT_I4:
+    case VT_INT: plain(Integral<std::int32_t>(d), true); break;
+    case VT_UI4:
+    case VT_UINT: plain(Integral<std::uint32_t>(d), true); break;
     case VT_I8: plain(Integral<std::int64_t>(d), true); break;
     case VT_I2: plain(Integral<std::int16_t>(d), false); break;
     case VT_UI1: plain(Integral<std::uint8_t>(d), false); break;
     case VT_BSTR: {
         const std::u16string text = Text();
-        const BSTR s = text.empty() && (m_in.Byte() & 1) ? nullptr : SysAllocStringLen(text.data(), static_cast<UINT>(text.size()));
+        const BSTR s = text.empty() && (m_in.Byte() & 1)
+                           ? nullptr
+                           : SysAllocStringLen(text.data(), static_cast<UINT>(text.size()));
         std::memcpy(slot, &s, sizeof s);
         value = Value{VT_BSTR, 0, text};
         break;
@@ -218,8 +227,14 @@ void EventBuilder::PutVariant(VARIANT* slot, std::optional<double>& number, std:
     case 2: v = CComVariant(std::u16string_view(Text())); break;
     case 3: break;  // empty
     case 4: v = CComVariant(m_in.Flag()); break;
-    case 5: v.vt = VT_I2; v.iVal = Integral<std::int16_t>(Number()); break;
-    case 6: v.vt = VT_UI8; v.ullVal = Integral<std::uint64_t>(Number()); break;
+    case 5:
+        v.vt = VT_I2;
+        v.iVal = Integral<std::int16_t>(Number());
+        break;
+    case 6:
+        v.vt = VT_UI8;
+        v.ullVal = Integral<std::uint64_t>(Number());
+        break;
     case 7: {  // a variant by reference (the runtime passes its own memory)
         m_pool.emplace_back(Number());
         v.vt = VT_VARIANT | VT_BYREF;
@@ -238,20 +253,27 @@ void EventBuilder::PutVariant(VARIANT* slot, std::optional<double>& number, std:
         v.pbstrVal = &m_pool.back().bstrVal;
         break;
     }
-    default: v.vt = VT_VARIANT | VT_BYREF; v.pvarVal = nullptr; break;  // a null reference
+    default:
+        v.vt = VT_VARIANT | VT_BYREF;
+        v.pvarVal = nullptr;
+        break;  // a null reference
     }
     VariantCopy(slot, &v);
     // What the link must read: numbers of numeric variants (also behind a
     // variant reference); the value itself, by-reference ones as values.
-    const Value seen = kind == 7 ? ValueOf(*v.pvarVal) : kind == 8 ? Value{VT_R8, *v.pdblVal, {}}
-                     : kind == 9 ? ValueOf(m_pool.back()) : kind == 10 ? Value{} : ValueOf(v);
+    const Value seen = kind == 7    ? ValueOf(*v.pvarVal)
+                       : kind == 8  ? Value{VT_R8, *v.pdblVal, {}}
+                       : kind == 9  ? ValueOf(m_pool.back())
+                       : kind == 10 ? Value{}
+                                    : ValueOf(v);
     if (kind == 0 || kind == 1 || kind == 5 || kind == 6 || kind == 7) number = seen.number;
     value = seen;
 }
 
-CComVariant EventBuilder::Array(std::vector<std::optional<double>>& numbers, std::vector<std::optional<Value>>& values) {
-    static constexpr VARTYPE kTypes[] = {VT_R8, VT_VARIANT, VT_R8, VT_VARIANT, VT_R4, VT_I4, VT_INT, VT_UI4,
-                                         VT_UINT, VT_I8, VT_DATE, VT_BSTR, VT_I2, VT_UI1};
+CComVariant EventBuilder::Array(std::vector<std::optional<double>>& numbers,
+                                std::vector<std::optional<Value>>& values) {
+    static constexpr VARTYPE kTypes[] = {VT_R8,  VT_VARIANT, VT_R8, VT_VARIANT, VT_R4,   VT_I4, VT_INT,
+                                         VT_UI4, VT_UINT,    VT_I8, VT_DATE,    VT_BSTR, VT_I2, VT_UI1};
     const std::uint8_t shape = m_in.Byte();
     if (shape % 16 == 15) return shape & 16 ? CComVariant() : CComVariant(Number());  // not an array
     const VARTYPE vt = kTypes[shape % 16 % std::size(kTypes)];
@@ -295,7 +317,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
     args.push_back(builder.Numbers(highs));
     args.push_back(builder.Numbers(times));
     if (layout % 8 == 0) args.resize(in.Byte() % args.size());  // too few arguments
-    else if (layout % 8 == 1) args.emplace_back(1.0);              // one too many
+    else if (layout % 8 == 1) args.emplace_back(1.0);           // one too many
     const bool whole = args.size() >= 6;
 
     // The model: each element present in all five arrays and readable, whose id is subscribed.
@@ -315,7 +337,8 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
     FuzzCheck(link.runtime->FireRawBulkChange(u"Plant", u"", args, layout & 16), "the event is fired");
     link.manager->ProcessPending();
 
-    FuzzCheck(got.changes.size() + got.queueFull.size() == expected.size(), "every whole subscribed element is delivered or reported");
+    FuzzCheck(got.changes.size() + got.queueFull.size() == expected.size(),
+              "every whole subscribed element is delivered or reported");
     FuzzCheck(got.changes.size() >= std::min<std::size_t>(expected.size(), static_cast<std::size_t>(link.queueLimit)),
               "the queue takes at least its limit");
     for (std::size_t i = 0; i < got.changes.size(); ++i) {

@@ -15,7 +15,7 @@
 namespace {
 
 struct Part {
-    std::string name;  // trimmed, lower case, as the parser compares it
+    std::string name;   // trimmed, lower case, as the parser compares it
     std::string value;  // trimmed
     std::string whole;  // as written
 };
@@ -55,7 +55,8 @@ std::vector<std::string> Secrets(const std::vector<Part>& parts) {
     for (const Part& part : parts) {
         if (!IsSecretName(part.name) || part.value.size() < 8) continue;
         bool elsewhere = false;
-        for (const Part& other : parts) elsewhere |= !IsSecretName(other.name) && other.whole.find(part.value) != std::string::npos;
+        for (const Part& other : parts)
+            elsewhere |= !IsSecretName(other.name) && other.whole.find(part.value) != std::string::npos;
         if (!elsewhere) secrets.push_back(part.value);
     }
     return secrets;
@@ -76,7 +77,8 @@ std::string WithoutSecrets(const std::vector<Part>& parts) {
         }
         const std::size_t eq = part.whole.find('=');
         const std::size_t at = part.whole.find(part.value, eq);
-        text += part.whole.substr(0, at) + std::string(part.value.size(), '0') + part.whole.substr(at + part.value.size());
+        text += part.whole.substr(0, at) + std::string(part.value.size(), '0') +
+                part.whole.substr(at + part.value.size());
     }
     return text;
 }

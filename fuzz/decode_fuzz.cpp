@@ -53,11 +53,12 @@ std::string Reencode(corvell::Format format, const std::vector<DecodedRow>& rows
 
 void CheckLineRoundTrip(const DecodedRow& row) {
     std::string entity, format, id;
-    const auto back = azurelocal::RowFromJsonLine(azurelocal::RowToJsonLine(row, "queue/a", "JSON", "m-1"), &entity, &format, &id);
+    const auto back =
+        azurelocal::RowFromJsonLine(azurelocal::RowToJsonLine(row, "queue/a", "JSON", "m-1"), &entity, &format, &id);
     FuzzCheck(back.has_value(), "a recorded line reads back");
     FuzzCheck(back->project == row.project && back->variable == row.variable && back->isText == row.isText &&
-                  back->text == row.text && SameNumber(back->value, row.value) && back->milliseconds == row.milliseconds &&
-                  back->status == row.status,
+                  back->text == row.text && SameNumber(back->value, row.value) &&
+                  back->milliseconds == row.milliseconds && back->status == row.status,
               "a recorded line keeps the row");
     FuzzCheck(back->time == row.time, "a recorded line keeps the time");
     FuzzCheck(entity == "queue/a" && format == "JSON" && id == "m-1", "a recorded line keeps its labels");
@@ -75,7 +76,8 @@ void CheckBody(corvell::Format format, std::string_view body) {
         FuzzCheck(azurelocal::IsValidUtf8(row.project) && azurelocal::IsValidUtf8(row.variable) &&
                       azurelocal::IsValidUtf8(row.text),
                   "accepted texts are valid UTF-8");
-        FuzzCheck(format == corvell::Format::Bond || row.milliseconds <= 999, "milliseconds of a time stamp are below 1000");
+        FuzzCheck(format == corvell::Format::Bond || row.milliseconds <= 999,
+                  "milliseconds of a time stamp are below 1000");
         CheckLineRoundTrip(row);
     }
     if (result.rows.empty()) return;
@@ -110,7 +112,8 @@ void CheckSignature(FuzzBytes& in) {
     const std::string resource = "ns/" + corvell::PercentEncode(entity);
     const corvell::SasToken token = corvell::MakeSasToken("https://" + resource, "k", key, 2000);
     FuzzCheck(azurelocal::CheckSasToken(token.token, "k", key, resource, 1000, why), "a made token is accepted");
-    FuzzCheck(azurelocal::CheckSasToken(token.token, "k", key, resource + "/x", 1000, why), "a made token covers what lies below");
+    FuzzCheck(azurelocal::CheckSasToken(token.token, "k", key, resource + "/x", 1000, why),
+              "a made token covers what lies below");
     FuzzCheck(!azurelocal::CheckSasToken(token.token, "k", key + "x", resource, 1000, why), "another key is refused");
     FuzzCheck(!azurelocal::CheckSasToken(token.token, "k", key, resource, 2000, why), "an expired token is refused");
 }
@@ -120,12 +123,12 @@ void CheckSignature(FuzzBytes& in) {
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
     FuzzBytes in(data, size);
     switch (in.Byte() % 6) {
-        case 0: CheckBody(corvell::Format::Json, in.Rest()); break;
-        case 1: CheckBody(corvell::Format::Xml, in.Rest()); break;
-        case 2: CheckBody(corvell::Format::Bond, in.Rest()); break;
-        case 3: CheckLine(in.Rest()); break;
-        case 4: CheckJson(in.Rest()); break;
-        default: CheckSignature(in); break;
+    case 0: CheckBody(corvell::Format::Json, in.Rest()); break;
+    case 1: CheckBody(corvell::Format::Xml, in.Rest()); break;
+    case 2: CheckBody(corvell::Format::Bond, in.Rest()); break;
+    case 3: CheckLine(in.Rest()); break;
+    case 4: CheckJson(in.Rest()); break;
+    default: CheckSignature(in); break;
     }
     return 0;
 }

@@ -65,7 +65,7 @@ void CheckReencoding(std::string_view bytes) {
     FuzzCheck(doc.SetValue(u"VARIABLES", u"NAME_\u4e2d", wide), "a valid write must be accepted");
     if (ansi) {
         FuzzCheck(doc.GetEncoding() == VX_CIniDocument::Encoding::Utf16Le,
-              "a character beyond the code page must give UTF-16LE");
+                  "a character beyond the code page must give UTF-16LE");
     }
     const VX_CIniDocument again = VX_CIniDocument::Parse(doc.Serialize());
     FuzzCheck(again.GetValue(u"variables", u"name_\u4e2d") == wide, "a write beyond the code page must read back");

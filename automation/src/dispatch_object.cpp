@@ -21,8 +21,10 @@ bool NumberOf(const VARIANT& v, double* number) {
     case VT_UI1: *number = byRef ? *v.pbVal : v.bVal; return true;
     case VT_I2: *number = byRef ? *v.piVal : v.iVal; return true;
     case VT_UI2: *number = byRef ? *v.puiVal : v.uiVal; return true;
-    case VT_I4: case VT_INT: *number = byRef ? *v.plVal : v.lVal; return true;
-    case VT_UI4: case VT_UINT: *number = byRef ? *v.pulVal : v.ulVal; return true;
+    case VT_I4:
+    case VT_INT: *number = byRef ? *v.plVal : v.lVal; return true;
+    case VT_UI4:
+    case VT_UINT: *number = byRef ? *v.pulVal : v.ulVal; return true;
     case VT_I8: *number = static_cast<double>(byRef ? *v.pllVal : v.llVal); return true;
     case VT_UI8: *number = static_cast<double>(byRef ? *v.pullVal : v.ullVal); return true;
     case VT_R4: *number = byRef ? *v.pfltVal : v.fltVal; return true;
@@ -34,9 +36,7 @@ bool NumberOf(const VARIANT& v, double* number) {
 
 }  // namespace
 
-const VARIANT& DispatchArgs::operator[](UINT i) const {
-    return Resolve(m_params.rgvarg[m_params.cArgs - 1 - i]);
-}
+const VARIANT& DispatchArgs::operator[](UINT i) const { return Resolve(m_params.rgvarg[m_params.cArgs - 1 - i]); }
 
 bool DispatchArgs::IsText(UINT i) const {
     const VARIANT& v = (*this)[i];
@@ -61,8 +61,7 @@ HRESULT DispatchArgs::GetInteger(UINT i, LONG* value) const {
 }
 
 HRESULT RunDispatchMember(WORD kind, UINT argCount, WORD flags, DISPPARAMS* params, VARIANT* result,
-                          EXCEPINFO* exception, HRESULT (*call)(void*, const DispatchArgs&, VARIANT*),
-                          void* context) {
+                          EXCEPINFO* exception, HRESULT (*call)(void*, const DispatchArgs&, VARIANT*), void* context) {
     if (!(flags & kind)) return DISP_E_MEMBERNOTFOUND;
     DISPPARAMS none{nullptr, nullptr, 0, 0};
     if (!params) params = &none;

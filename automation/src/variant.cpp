@@ -28,9 +28,7 @@ void SysFreeString(BSTR text) {
     if (text) std::free(reinterpret_cast<std::uint32_t*>(text) - 1);
 }
 
-UINT SysStringLen(BSTR text) {
-    return text ? reinterpret_cast<const std::uint32_t*>(text)[-1] / sizeof(char16_t) : 0;
-}
+UINT SysStringLen(BSTR text) { return text ? reinterpret_cast<const std::uint32_t*>(text)[-1] / sizeof(char16_t) : 0; }
 
 // ---- VARIANT ---------------------------------------------------------------
 
@@ -76,12 +74,25 @@ namespace {
 
 std::uint32_t ElementSize(VARTYPE vt) {
     switch (vt) {
-    case VT_I1: case VT_UI1: return 1;
-    case VT_I2: case VT_UI2: case VT_BOOL: return 2;
-    case VT_I4: case VT_UI4: case VT_INT: case VT_UINT: case VT_R4: case VT_ERROR: return 4;
-    case VT_I8: case VT_UI8: case VT_R8: case VT_CY: case VT_DATE: return 8;
+    case VT_I1:
+    case VT_UI1: return 1;
+    case VT_I2:
+    case VT_UI2:
+    case VT_BOOL: return 2;
+    case VT_I4:
+    case VT_UI4:
+    case VT_INT:
+    case VT_UINT:
+    case VT_R4:
+    case VT_ERROR: return 4;
+    case VT_I8:
+    case VT_UI8:
+    case VT_R8:
+    case VT_CY:
+    case VT_DATE: return 8;
     case VT_BSTR: return sizeof(BSTR);
-    case VT_DISPATCH: case VT_UNKNOWN: return sizeof(IUnknown*);
+    case VT_DISPATCH:
+    case VT_UNKNOWN: return sizeof(IUnknown*);
     case VT_VARIANT: return sizeof(VARIANT);
     default: return 0;
     }
@@ -94,8 +105,12 @@ void* ElementAt(const SAFEARRAY* a, std::uint32_t offset) {
 // Frees what one element owns.
 void ClearElement(const SAFEARRAY* a, void* element) {
     switch (a->vt) {
-    case VT_BSTR: SysFreeString(*static_cast<BSTR*>(element)); *static_cast<BSTR*>(element) = nullptr; break;
-    case VT_DISPATCH: case VT_UNKNOWN: {
+    case VT_BSTR:
+        SysFreeString(*static_cast<BSTR*>(element));
+        *static_cast<BSTR*>(element) = nullptr;
+        break;
+    case VT_DISPATCH:
+    case VT_UNKNOWN: {
         auto*& p = *static_cast<IUnknown**>(element);
         if (p) p->Release();
         p = nullptr;
@@ -116,7 +131,8 @@ HRESULT CopyElement(VARTYPE vt, std::uint32_t size, void* dest, const void* src)
         *static_cast<BSTR*>(dest) = copy;
         return S_OK;
     }
-    case VT_DISPATCH: case VT_UNKNOWN: {
+    case VT_DISPATCH:
+    case VT_UNKNOWN: {
         IUnknown* p = *static_cast<IUnknown* const*>(src);
         if (p) p->AddRef();
         *static_cast<IUnknown**>(dest) = p;
@@ -125,9 +141,7 @@ HRESULT CopyElement(VARTYPE vt, std::uint32_t size, void* dest, const void* src)
     case VT_VARIANT:
         VariantInit(static_cast<VARIANT*>(dest));
         return VariantCopy(static_cast<VARIANT*>(dest), static_cast<const VARIANT*>(src));
-    default:
-        std::memcpy(dest, src, size);
-        return S_OK;
+    default: std::memcpy(dest, src, size); return S_OK;
     }
 }
 

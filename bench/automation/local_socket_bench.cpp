@@ -34,9 +34,10 @@ struct Setup {
     bool ready = false;
 
     explicit Setup(int variables) {
-        const std::string project = folder.Write("bench.json",
+        const std::string project = folder.Write(
+            "bench.json",
             R"({"tick_ms": 100, "projects": [{"name": "Bench", "variables": [{"name": "V{n}", "repeat": )" +
-            std::to_string(variables) + R"(, "generator": {"kind": "counter", "period_ms": 100}}]}]})");
+                std::to_string(variables) + R"(, "generator": {"kind": "counter", "period_ms": 100}}]}]})");
         LocalSocketOptions options;
         options.folder = folder.Path("sockets");
         source = AddRunningObjectSource(CreateLocalSocketSource(options));
@@ -83,7 +84,8 @@ void BM_BulkChangeAcrossSocket(benchmark::State& state) {
         return;
     }
     for (auto _ : state) setup.control->Tick();
-    const auto expected = static_cast<unsigned long long>(state.iterations()) * static_cast<unsigned long long>(variables);
+    const auto expected = static_cast<unsigned long long>(state.iterations()) *
+                          static_cast<unsigned long long>(variables);
     if (setup.sink->changes != expected) state.SkipWithError("the sink did not get every change");
     state.SetItemsProcessed(static_cast<int64_t>(setup.sink->changes.load()));
     state.counters["changes/event"] = variables;

@@ -138,7 +138,8 @@ void EndToEnd(benchmark::State& state, Format format, bool eventHub) {
     }
     const auto stats = server->Stats();
     state.SetItemsProcessed(static_cast<int64_t>(rows));
-    state.counters["bytes_per_row"] = stats.rows ? static_cast<double>(stats.bytes) / static_cast<double>(stats.rows) : 0;
+    state.counters["bytes_per_row"] = stats.rows ? static_cast<double>(stats.bytes) / static_cast<double>(stats.rows)
+                                                 : 0;
     state.counters["rows_per_message"] =
         stats.messages ? static_cast<double>(stats.rows) / static_cast<double>(stats.messages) : 0;
 }

@@ -36,9 +36,9 @@ std::uint64_t Sample(const std::string& text, const std::string& name) {
 
 const char* FormatName(BodyFormat format) {
     switch (format) {
-        case BodyFormat::Xml: return "XML";
-        case BodyFormat::Json: return "JSON";
-        case BodyFormat::Bond: return "BOND";
+    case BodyFormat::Xml: return "XML";
+    case BodyFormat::Json: return "JSON";
+    case BodyFormat::Bond: return "BOND";
     }
     return "?";
 }
@@ -81,8 +81,9 @@ void RunFolder::WriteSettings(const GatewayShape& shape, const azurelocal::Azure
 }
 
 void RunFolder::WriteLogConfig() const {
-    WriteFile(Path("brennic.ini"), "[file]\npath = " + Path("gateway.log") +
-                                       "\nkeep = 0\nmax_size = 1G\n[stderr]\nenabled = no\n[queue]\ncapacity = 10000000\n");
+    WriteFile(Path("brennic.ini"),
+              "[file]\npath = " + Path("gateway.log") +
+                  "\nkeep = 0\nmax_size = 1G\n[stderr]\nenabled = no\n[queue]\ncapacity = 10000000\n");
 }
 
 Metrics ReadMetrics(const std::string& path) {
@@ -154,9 +155,7 @@ std::uint64_t ProcessRssBytes(pid_t pid) {
     return 0;
 }
 
-double Now() {
-    return std::chrono::duration<double>(std::chrono::steady_clock::now().time_since_epoch()).count();
-}
+double Now() { return std::chrono::duration<double>(std::chrono::steady_clock::now().time_since_epoch()).count(); }
 
 void Pause(double seconds) { std::this_thread::sleep_for(std::chrono::duration<double>(seconds)); }
 
@@ -174,8 +173,7 @@ GatewayRun::GatewayRun(const RunFolder& folder, const std::string& statusInterva
     : m_process({"run", "--ini", folder.Path("skyvane.ini"), "--simulate", folder.Path("project.json"),
                  "--status-interval", statusInterval, "--metrics-file", folder.Path("gateway.prom")},
                 GatewayEnvironment(folder)),
-      m_metricsPath(folder.Path("gateway.prom")),
-      m_startedAt(Now()) {
+      m_metricsPath(folder.Path("gateway.prom")), m_startedAt(Now()) {
     if (m_process.Pid() <= 0) throw std::runtime_error("skyvane-gateway did not start");
 }
 
@@ -192,8 +190,8 @@ int GatewayRun::Stop() {
 }
 
 std::unique_ptr<azurelocal::AzureLocalProcess> StartReceiver(bool decode, std::string& error) {
-    return azurelocal::AzureLocalProcess::Start(
-        decode ? QStringList{"--keep-rows", "0"} : QStringList{"--count-only"}, error);
+    return azurelocal::AzureLocalProcess::Start(decode ? QStringList{"--keep-rows", "0"} : QStringList{"--count-only"},
+                                                error);
 }
 
 }  // namespace e2e

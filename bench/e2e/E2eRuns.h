@@ -28,8 +28,8 @@ struct ProjectShape {
 };
 
 struct GatewayShape {
-    int configured = 10000;   // variables named in the settings (the first of the project)
-    int connections = 1;      // targets, all on the same receiver, each its own queue
+    int configured = 10000;  // variables named in the settings (the first of the project)
+    int connections = 1;     // targets, all on the same receiver, each its own queue
     BodyFormat format = BodyFormat::Json;
     int integritySeconds = 3600;  // long: only the first cycle is a full send
 };

@@ -37,8 +37,8 @@ struct Plan {
     bool smoke = false;
     int variables = 10000;
     int bigVariables = 100000;
-    double warm = 1.0;     // after the first values, before a window
-    double window = 5.0;   // a measured window
+    double warm = 1.0;    // after the first values, before a window
+    double window = 5.0;  // a measured window
     double idle = 60.0;
     double clientSeconds = 3.0;  // each bare-sender and receiver-ceiling loop
     std::vector<double> rates{100000, 200000, 300000, 400000, 500000};
@@ -89,8 +89,8 @@ public:
         std::printf("|---|---|---|---|---|---|---|---|\n");
         for (const Line& l : m_lines) {
             std::printf("| %s | %s | %s | %s | %s | %s | %s | %.2f |\n", l.figure.c_str(), l.setup.c_str(),
-                        l.measured.c_str(), l.reference.c_str(), l.ratio.c_str(), l.target.c_str(),
-                        l.verdict.c_str(), l.load);
+                        l.measured.c_str(), l.reference.c_str(), l.ratio.c_str(), l.target.c_str(), l.verdict.c_str(),
+                        l.load);
         }
     }
 
@@ -203,7 +203,7 @@ struct RateRun {
     double offered = 0;   // changes per second the stand-in fired in the window
     double received = 0;  // changes per second that arrived (rows / connections)
     std::uint64_t fired = 0, dropped = 0;
-    long long lost = 0;   // neither received nor reported dropped
+    long long lost = 0;  // neither received nor reported dropped
     bool clean = false;
 };
 
@@ -255,9 +255,9 @@ RateRun RunRate(AzureLocalProcess& receiver, const e2e::GatewayShape& shape, dou
 
     RateRun run;
     // No metrics written in the window: the window thread was busy all along.
-    run.offered = m1.writtenAt > m0.writtenAt ? static_cast<double>(m1.changesFired - m0.changesFired) /
-                                                    (m1.writtenAt - m0.writtenAt)
-                                              : std::nan("");
+    run.offered = m1.writtenAt > m0.writtenAt
+                      ? static_cast<double>(m1.changesFired - m0.changesFired) / (m1.writtenAt - m0.writtenAt)
+                      : std::nan("");
     run.received = static_cast<double>(s1.rows - s0.rows) / (t1 - t0) / static_cast<double>(connections);
     const e2e::Metrics end = e2e::ReadMetrics(folder.Path("gateway.prom"));
     const e2e::DropReport drops = e2e::CountDropReports(folder.Path("gateway.log"));
@@ -267,7 +267,8 @@ RateRun RunRate(AzureLocalProcess& receiver, const e2e::GatewayShape& shape, dou
     const auto arrived = receiver.Stats().rows;
     run.lost = static_cast<long long>(run.fired - run.dropped) - static_cast<long long>(arrived / connections);
     run.clean = run.dropped == 0 && run.lost == 0 && !std::isnan(run.offered) && run.received >= 0.9 * run.offered;
-    std::fprintf(stderr, "e2e:   %s x%d at %.0f/s: offered %.0f/s, received %.0f/s, fired %llu, dropped %llu, lost %lld\n",
+    std::fprintf(stderr,
+                 "e2e:   %s x%d at %.0f/s: offered %.0f/s, received %.0f/s, fired %llu, dropped %llu, lost %lld\n",
                  e2e::FormatName(shape.format), shape.connections, rate, run.offered, run.received,
                  static_cast<unsigned long long>(run.fired), static_cast<unsigned long long>(run.dropped), run.lost);
     return run;
@@ -422,8 +423,9 @@ void MeasureThroughput(Receivers& receivers, const Plan& plan, Table& table, dou
     for (const Setup& setup : setups) {
         const double bare = BareSender(receiver, setup.format, plan.variables, plan.clientSeconds);
         const std::string name = std::string(e2e::FormatName(setup.format)) + " x" + std::to_string(setup.connections);
-        table.Add({"bare sender", std::string(e2e::FormatName(setup.format)) + ", " + std::to_string(plan.variables) +
-                                      "-row batches through libCorvell.so",
+        table.Add({"bare sender",
+                   std::string(e2e::FormatName(setup.format)) + ", " + std::to_string(plan.variables) +
+                       "-row batches through libCorvell.so",
                    Rate(bare) + " rows", "", "", "", ""});
         std::string account;
         const RateRun best = Sweep(receiver, {plan.variables, setup.connections, setup.format, 3600}, plan, account);
@@ -443,8 +445,8 @@ void MeasureThroughput(Receivers& receivers, const Plan& plan, Table& table, dou
 void MeasureLatency(Receivers& receivers, const Plan& plan, double sustainedJson, Table& table) {
     const double rate = std::max(1000.0, 0.1 * sustainedJson);
     const Latency latency = RunLatency(*receivers.decoding, rate, plan);
-    table.Add({"change to receiver latency", "JSON x1 at " + Rate(rate) + " (10 % of sustained), " +
-                                                 std::to_string(latency.rows) + " rows",
+    table.Add({"change to receiver latency",
+               "JSON x1 at " + Rate(rate) + " (10 % of sustained), " + std::to_string(latency.rows) + " rows",
                "p50 " + std::to_string(latency.p50) + " ms, p99 " + std::to_string(latency.p99) + " ms",
                "floor 50 ms tick + 10 ms sleep", "", "p50 <= 60 ms, p99 <= 150 ms",
                Verdict(latency.p50 >= 0 && latency.p50 <= 60 && latency.p99 <= 150)});
@@ -454,12 +456,14 @@ void MeasureIdle(Receivers& receivers, const Plan& plan, Table& table) {
     AzureLocalProcess& receiver = *receivers.counting;
     const double standIn = RunIdle(receiver, plan.variables, 0, 3600, plan.idle);
     const double still = RunIdle(receiver, plan.variables, plan.variables, 3600, plan.idle);
-    table.Add({"idle cost", std::to_string(plan.variables) + " variables configured, no changes, " +
-                                Format("%.0f s", plan.idle) + ", no full send in the window",
+    table.Add({"idle cost",
+               std::to_string(plan.variables) + " variables configured, no changes, " + Format("%.0f s", plan.idle) +
+                   ", no full send in the window",
                Format("%.2f %% of one core", still), Format("stand-in alone %.2f %%", standIn), "", "<= 1 %",
                Verdict(still <= 1.0)});
     const double integrity = RunIdle(receiver, plan.variables, plan.variables, 5, plan.smoke ? plan.idle : 20);
-    table.Add({"idle cost with full sends", std::to_string(plan.variables) + " variables, no changes, full send every 5 s",
+    table.Add({"idle cost with full sends",
+               std::to_string(plan.variables) + " variables, no changes, full send every 5 s",
                Format("%.2f %% of one core", integrity), "", "", "", ""});
 }
 
@@ -467,8 +471,8 @@ void MeasureFootprints(Receivers& receivers, const Plan& plan, Table& table) {
     for (int variables : {plan.variables, plan.bigVariables}) {
         const Footprint empty = RunFootprint(*receivers.counting, variables, 0);
         const Footprint full = RunFootprint(*receivers.counting, variables, variables);
-        const double perVariable =
-            (static_cast<double>(full.rss) - static_cast<double>(empty.rss)) / static_cast<double>(variables);
+        const double perVariable = (static_cast<double>(full.rss) - static_cast<double>(empty.rss)) /
+                                   static_cast<double>(variables);
         table.Add({"memory per variable", std::to_string(variables) + " configured; the same stand-in project without",
                    Format("%.0f bytes", perVariable),
                    Format("RSS %.1f MB", static_cast<double>(full.rss) / 1e6) +

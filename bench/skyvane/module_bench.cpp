@@ -29,7 +29,7 @@ double CpuSeconds() {
 }
 
 struct RateResult {
-    double offered = 0;    // changes per second fired
+    double offered = 0;  // changes per second fired
     long fired = 0;
     long received = 0;
     double throughput = 0;  // received per second, first fire to last row
@@ -58,14 +58,16 @@ RateResult RunRate(CBulkPlant& plant, azurelocal::AzureLocalProcess& receiver, d
     result.fired = static_cast<long>(rounds) * kVariables;
     long seen = -1;
     auto lastChange = Clock::now(), lastRow = Clock::now();
-    PumpUntil([&] {
-        const long now = static_cast<long>(receiver.Stats().rows) - before;
-        if (now != seen) {
-            seen = now;
-            lastChange = lastRow = Clock::now();
-        }
-        return now >= result.fired || Clock::now() - lastChange > std::chrono::seconds(2);
-    }, std::chrono::seconds(120));
+    PumpUntil(
+        [&] {
+            const long now = static_cast<long>(receiver.Stats().rows) - before;
+            if (now != seen) {
+                seen = now;
+                lastChange = lastRow = Clock::now();
+            }
+            return now >= result.fired || Clock::now() - lastChange > std::chrono::seconds(2);
+        },
+        std::chrono::seconds(120));
     result.received = seen;
     result.throughput = seen / std::chrono::duration<double>(lastRow - start).count();
     return result;

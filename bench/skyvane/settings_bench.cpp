@@ -17,7 +17,8 @@ namespace {
 
 CString ScratchPath() {
     const char* dir = std::getenv("TMPDIR");
-    return CString::FromUtf8(std::string(dir && *dir ? dir : "/tmp") + "/skyvane-bench-" + std::to_string(getpid()) + ".ini");
+    return CString::FromUtf8(std::string(dir && *dir ? dir : "/tmp") + "/skyvane-bench-" + std::to_string(getpid()) +
+                             ".ini");
 }
 
 CAzureConfig MakeConfig(int variables) {
@@ -28,7 +29,8 @@ CAzureConfig MakeConfig(int variables) {
         config.m_mapVariables.SetAt(item->m_strName, item);
     }
     auto* connection = new CConnection;
-    connection->m_strConnection = u"Endpoint=sb://ns.servicebus.windows.net/;SharedAccessKeyName=send;SharedAccessKey=abc=";
+    connection->m_strConnection =
+        u"Endpoint=sb://ns.servicebus.windows.net/;SharedAccessKeyName=send;SharedAccessKey=abc=";
     connection->m_strQueue = u"telemetry";
     config.m_lstConnections.AddTail(connection);
     return config;

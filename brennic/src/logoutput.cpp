@@ -33,10 +33,10 @@ int WriteAll(int fd, std::string_view data) {
 
 int SyslogPriority(BYTE level) {
     switch (level) {
-        case LOG_LEVEL_ERROR: return LOG_ERR;
-        case LOG_LEVEL_WARNING: return LOG_WARNING;
-        case LOG_LEVEL_INFO: return LOG_INFO;
-        default: return LOG_DEBUG;
+    case LOG_LEVEL_ERROR: return LOG_ERR;
+    case LOG_LEVEL_WARNING: return LOG_WARNING;
+    case LOG_LEVEL_INFO: return LOG_INFO;
+    default: return LOG_DEBUG;
     }
 }
 
@@ -57,13 +57,13 @@ void AppendEscaped(std::string& out, std::u16string_view text) {
         out.append(utf8, runStart, i - runStart);
         runStart = i + 1;
         switch (byte) {
-            case '\n': out += "\\n"; break;
-            case '\r': out += "\\r"; break;
-            case '\t': out += "\\t"; break;
-            default: {
-                const char escaped[] = {'\\', 'x', kHex[byte >> 4], kHex[byte & 0xF]};
-                out.append(escaped, sizeof escaped);
-            }
+        case '\n': out += "\\n"; break;
+        case '\r': out += "\\r"; break;
+        case '\t': out += "\\t"; break;
+        default: {
+            const char escaped[] = {'\\', 'x', kHex[byte >> 4], kHex[byte & 0xF]};
+            out.append(escaped, sizeof escaped);
+        }
         }
     }
     out.append(utf8, runStart, std::string::npos);
@@ -71,19 +71,19 @@ void AppendEscaped(std::string& out, std::u16string_view text) {
 
 void AppendLevelName(std::string& out, BYTE level) {
     switch (level) {
-        case LOG_LEVEL_ERROR: out += "ERROR"; return;
-        case LOG_LEVEL_WARNING: out += "WARNING"; return;
-        case LOG_LEVEL_DEBUG1: out += "DEBUG1"; return;
-        case LOG_LEVEL_DEBUG2: out += "DEBUG2"; return;
-        case LOG_LEVEL_DEBUG3: out += "DEBUG3"; return;
-        case LOG_LEVEL_DEBUG4: out += "DEBUG4"; return;
-        case LOG_LEVEL_TRACE: out += "TRACE"; return;
-        case LOG_LEVEL_INFO: out += "INFO"; return;
-        default: {
-            static const char kHex[] = "0123456789ABCDEF";
-            const char text[] = {'L', 'E', 'V', 'E', 'L', '(', '0', 'x', kHex[level >> 4], kHex[level & 0xF], ')'};
-            out.append(text, sizeof text);
-        }
+    case LOG_LEVEL_ERROR: out += "ERROR"; return;
+    case LOG_LEVEL_WARNING: out += "WARNING"; return;
+    case LOG_LEVEL_DEBUG1: out += "DEBUG1"; return;
+    case LOG_LEVEL_DEBUG2: out += "DEBUG2"; return;
+    case LOG_LEVEL_DEBUG3: out += "DEBUG3"; return;
+    case LOG_LEVEL_DEBUG4: out += "DEBUG4"; return;
+    case LOG_LEVEL_TRACE: out += "TRACE"; return;
+    case LOG_LEVEL_INFO: out += "INFO"; return;
+    default: {
+        static const char kHex[] = "0123456789ABCDEF";
+        const char text[] = {'L', 'E', 'V', 'E', 'L', '(', '0', 'x', kHex[level >> 4], kHex[level & 0xF], ')'};
+        out.append(text, sizeof text);
+    }
     }
 }
 

@@ -66,9 +66,9 @@ private:
     unsigned long long m_maxBytes = 0;
     int m_keep = 0;
     int m_fd = -1;
-    unsigned long long m_size = 0;     // bytes in the current file, written or pending
-    std::string m_pending;             // lines appended since the last commit
-    bool m_failing = false;            // a problem was reported and has not cleared
+    unsigned long long m_size = 0;  // bytes in the current file, written or pending
+    std::string m_pending;          // lines appended since the last commit
+    bool m_failing = false;         // a problem was reported and has not cleared
     unsigned long long m_nextOpenAttemptMs = 0;
 };
 
@@ -100,8 +100,8 @@ private:
     OutputConfig m_config;
     LineFormatter m_format;
     LogFile m_file;
-    std::string m_line;            // scratch buffer of the current record
-    std::string m_standardError;   // lines for standard error since the last commit
+    std::string m_line;           // scratch buffer of the current record
+    std::string m_standardError;  // lines for standard error since the last commit
 };
 
 }  // namespace brennic

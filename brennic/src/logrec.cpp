@@ -32,12 +32,14 @@ CLogRec::Clock::time_point FileTimeToTimePoint(const FILETIME& time) {
 }
 
 FILETIME TimePointToFileTime(CLogRec::Clock::time_point time) {
-    const auto ticks = std::chrono::duration_cast<FileTimeTicks>(time.time_since_epoch()).count() + kFileTimeEpochOffset;
+    const auto ticks = std::chrono::duration_cast<FileTimeTicks>(time.time_since_epoch()).count() +
+                       kFileTimeEpochOffset;
     const auto bits = static_cast<unsigned long long>(ticks);
     return FILETIME{static_cast<DWORD>(bits & 0xFFFFFFFFu), static_cast<DWORD>(bits >> 32)};
 }
 
-CLogField::CLogField(WORD id, std::u16string_view text, BYTE flags) : m_wId(id), m_nFlags(flags), m_strText(Bounded(text)) {}
+CLogField::CLogField(WORD id, std::u16string_view text, BYTE flags)
+    : m_wId(id), m_nFlags(flags), m_strText(Bounded(text)) {}
 
 CLogField* CLogField::CreateLogField(WORD id, const CString& text, BYTE flags) {
     return new (std::nothrow) CLogField(id, text.View(), flags);

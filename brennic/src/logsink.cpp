@@ -55,7 +55,7 @@ std::string FolderOf(const std::string& path) {
 
 // mkdir -p; problems surface when the file is opened.
 void MakeFolders(const std::string& folder) {
-    for (size_t pos = folder.find('/', 1); ; pos = folder.find('/', pos + 1)) {
+    for (size_t pos = folder.find('/', 1);; pos = folder.find('/', pos + 1)) {
         ::mkdir(folder.substr(0, pos).c_str(), 0750);
         if (pos == std::string::npos) break;
     }
@@ -276,9 +276,10 @@ void CLogSink::ReConnected() {
 }
 
 void CLogSink::FillClientModules(CStringArray& names) {
-    static const char16_t* const kStandardNames[] = {
-        u"Log",    u"System", u"Runtime", u"Editor", u"Network",  u"Driver", u"Archive", u"Alarm",
-        u"Recipe", u"Report", u"Script",  u"User",   u"Database", u"Web",    u"Service", u"Gateway"};
+    static const char16_t* const kStandardNames[] = {u"Log",      u"System", u"Runtime", u"Editor",
+                                                     u"Network",  u"Driver", u"Archive", u"Alarm",
+                                                     u"Recipe",   u"Report", u"Script",  u"User",
+                                                     u"Database", u"Web",    u"Service", u"Gateway"};
     for (const char16_t* name : kStandardNames) names.Add(name);
 }
 
@@ -319,8 +320,8 @@ bool CLogSink::StartServer() {
 }
 
 void CLogSink::LogVersioninfo() {
-    LogOwnRecord(LOG_LEVEL_INFO, CString::Formatted(u"Program '%s', log library %s, process %u",
-                                                    GetModuleFileNameW(), kLibraryVersion, GetCurrentProcessId()));
+    LogOwnRecord(LOG_LEVEL_INFO, CString::Formatted(u"Program '%s', log library %s, process %u", GetModuleFileNameW(),
+                                                    kLibraryVersion, GetCurrentProcessId()));
 }
 
 CString CLogSink::GetModuleFileNameW() { return CString::FromUtf8(ProgramPath()); }

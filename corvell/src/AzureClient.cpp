@@ -73,9 +73,7 @@ struct AzureClient::Target {
 };
 
 AzureClient::AzureClient(ILogger* logger, ProxySettings proxy, ClientOptions options)
-    : m_log(logger),
-      m_proxy(std::move(proxy)),
-      m_options(std::move(options)),
+    : m_log(logger), m_proxy(std::move(proxy)), m_options(std::move(options)),
       m_backoff(m_options.firstBackoff, m_options.maxBackoff) {
     if (!m_options.clock) m_options.clock = std::make_shared<ClientClock>();
     m_log.AddSecret(m_proxy.password);
@@ -141,8 +139,8 @@ bool AzureClient::Begin(std::u16string_view connectionString, std::u16string_vie
     if (entity.empty()) {
         entity = connection->entityPath;
     } else if (!connection->entityPath.empty() && !EqualIgnoringCase(entity, connection->entityPath)) {
-        m_log.Error("Azure batch not opened for " + where + ": the " + (eventHub ? "Event Hub" : "queue") +
-                    " name '" + Shorten(entity) + "' differs from the connection string's EntityPath '" +
+        m_log.Error("Azure batch not opened for " + where + ": the " + (eventHub ? "Event Hub" : "queue") + " name '" +
+                    Shorten(entity) + "' differs from the connection string's EntityPath '" +
                     Shorten(connection->entityPath) + "'");
         return false;
     }
@@ -233,8 +231,7 @@ std::size_t AzureClient::MessageLimit(const Target& target) const {
     return std::max<std::size_t>(1, std::min(m_maxMessageBytes, learned));
 }
 
-AzureClient::MessageOutcome AzureClient::SendMessage(std::size_t first, std::size_t last,
-                                                     Clock::time_point deadline) {
+AzureClient::MessageOutcome AzureClient::SendMessage(std::size_t first, std::size_t last, Clock::time_point deadline) {
     Target& target = *m_current;
     const std::string body = m_rows->Compose(first, last);
     const std::size_t rows = last - first;
@@ -258,37 +255,34 @@ AzureClient::MessageOutcome AzureClient::SendMessage(std::size_t first, std::siz
         };
         ++m_lastSend.requests;
         const HttpResponse response = target.http->Post(target.url, headers, body,
-                                                         std::min(m_options.requestTimeout, remaining),
-                                                         std::min(m_options.connectTimeout, remaining));
+                                                        std::min(m_options.requestTimeout, remaining),
+                                                        std::min(m_options.connectTimeout, remaining));
         const Outcome outcome = Classify(response);
         switch (outcome) {
-            case Outcome::Accepted:
-                ++m_lastSend.messages;
-                m_lastSend.bytes += body.size();
-                target.Accepted(body.size());
-                return {MessageResult::Accepted, {}};
-            case Outcome::TooLarge:
-                target.TooLarge(body.size());
-                m_log.Info("Azure " + target.name + " refused a message of " + std::to_string(body.size()) +
-                           " bytes (" + std::to_string(rows) + " rows) as too large (" + Describe(response) +
-                           "); messages to it are cut to " + std::to_string(MessageLimit(target)) +
-                           " bytes from now on");
-                return {MessageResult::TooLarge, Describe(response)};
-            case Outcome::Unauthorized:
-                if (renewed || !target.connection.sharedSignature.empty()) {
-                    return {MessageResult::Failed, Describe(response)};
-                }
-                renewed = true;
-                Token(target, true);
-                m_log.Info("Azure " + target.name + " refused the token; retrying once with a new one");
-                continue;
-            case Outcome::Permanent:
-                // A malformed message concerns that message only; every other
-                // refusal (403, 404, 410, TLS, ...) concerns the target.
-                return {response.status == 400 ? MessageResult::Refused : MessageResult::Failed,
-                        Describe(response)};
-            case Outcome::Transient:
-                break;
+        case Outcome::Accepted:
+            ++m_lastSend.messages;
+            m_lastSend.bytes += body.size();
+            target.Accepted(body.size());
+            return {MessageResult::Accepted, {}};
+        case Outcome::TooLarge:
+            target.TooLarge(body.size());
+            m_log.Info("Azure " + target.name + " refused a message of " + std::to_string(body.size()) + " bytes (" +
+                       std::to_string(rows) + " rows) as too large (" + Describe(response) +
+                       "); messages to it are cut to " + std::to_string(MessageLimit(target)) + " bytes from now on");
+            return {MessageResult::TooLarge, Describe(response)};
+        case Outcome::Unauthorized:
+            if (renewed || !target.connection.sharedSignature.empty()) {
+                return {MessageResult::Failed, Describe(response)};
+            }
+            renewed = true;
+            Token(target, true);
+            m_log.Info("Azure " + target.name + " refused the token; retrying once with a new one");
+            continue;
+        case Outcome::Permanent:
+            // A malformed message concerns that message only; every other
+            // refusal (403, 404, 410, TLS, ...) concerns the target.
+            return {response.status == 400 ? MessageResult::Refused : MessageResult::Failed, Describe(response)};
+        case Outcome::Transient: break;
         }
         if (attempt >= m_options.maxRetries) {
             return {MessageResult::Failed, Describe(response) + " after " + std::to_string(attempt + 1) + " attempts"};
@@ -301,8 +295,8 @@ AzureClient::MessageOutcome AzureClient::SendMessage(std::size_t first, std::siz
                                                std::to_string(m_options.sendBudget.count()) + " ms"};
         }
         ++attempt;
-        m_log.Info("Azure " + target.name + ": " + Describe(response) + "; retry " + std::to_string(attempt) +
-                   " of " + std::to_string(m_options.maxRetries) + " in " + std::to_string(wait.count()) + " ms");
+        m_log.Info("Azure " + target.name + ": " + Describe(response) + "; retry " + std::to_string(attempt) + " of " +
+                   std::to_string(m_options.maxRetries) + " in " + std::to_string(wait.count()) + " ms");
         m_options.clock->Sleep(wait);
     }
 }
@@ -318,9 +312,9 @@ bool AzureClient::Send() {
     const std::size_t count = m_rows->Count();
 
     std::size_t refusedRows = 0, refusedMessages = 0;
-    std::string refusal;       // why the first refused message was refused
+    std::string refusal;  // why the first refused message was refused
     std::size_t unsentRows = 0;
-    std::string stop;          // why the send ended before the last row
+    std::string stop;             // why the send ended before the last row
     std::size_t maxRows = count;  // after a too-large answer: fewer rows than that message held
     for (std::size_t first = 0; first < count;) {
         // Greedy cut: as many rows as the target's size limit allows, at least one.
@@ -335,27 +329,27 @@ bool AzureClient::Send() {
         }
         maxRows = count;
         switch (outcome.result) {
-            case MessageResult::Accepted:
-                m_lastSend.rows += rows;
-                first = last;
-                break;
-            case MessageResult::TooLarge:
-                maxRows = rows - 1;  // cut again, below the refused size
-                break;
-            case MessageResult::Refused:
-                ++refusedMessages;
-                refusedRows += rows;
-                if (refusal.empty()) refusal = outcome.reason;
-                first = last;
-                m_log.Info("Azure " + TargetName() + " refused a message of " + std::to_string(rows) + " rows (" +
-                           outcome.reason + "); " + std::to_string(m_lastSend.rows) + " rows delivered so far, " +
-                           std::to_string(count - first) + " still to send");
-                break;
-            case MessageResult::Failed:
-                unsentRows = count - first;
-                stop = outcome.reason;
-                first = count;
-                break;
+        case MessageResult::Accepted:
+            m_lastSend.rows += rows;
+            first = last;
+            break;
+        case MessageResult::TooLarge:
+            maxRows = rows - 1;  // cut again, below the refused size
+            break;
+        case MessageResult::Refused:
+            ++refusedMessages;
+            refusedRows += rows;
+            if (refusal.empty()) refusal = outcome.reason;
+            first = last;
+            m_log.Info("Azure " + TargetName() + " refused a message of " + std::to_string(rows) + " rows (" +
+                       outcome.reason + "); " + std::to_string(m_lastSend.rows) + " rows delivered so far, " +
+                       std::to_string(count - first) + " still to send");
+            break;
+        case MessageResult::Failed:
+            unsentRows = count - first;
+            stop = outcome.reason;
+            first = count;
+            break;
         }
     }
     const std::size_t failed = refusedRows + unsentRows;
@@ -371,8 +365,8 @@ bool AzureClient::Send() {
         m_log.Error(text);
     } else if (m_log.InfoEnabled()) {
         m_log.Info("Azure " + m_current->name + ": sent " + std::to_string(m_lastSend.rows) + " rows in " +
-                   std::to_string(m_lastSend.messages) + " messages (" + std::to_string(m_lastSend.bytes) +
-                   " bytes, " + std::to_string(m_lastSend.requests) + " requests) in " +
+                   std::to_string(m_lastSend.messages) + " messages (" + std::to_string(m_lastSend.bytes) + " bytes, " +
+                   std::to_string(m_lastSend.requests) + " requests) in " +
                    std::to_string(duration_cast<milliseconds>(m_options.clock->Now() - start).count()) + " ms");
     }
     m_rows.reset();  // the batch is closed, sent or not

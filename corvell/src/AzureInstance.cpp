@@ -73,7 +73,7 @@ private:
 }  // namespace corvell
 
 extern "C" corvell::IAzureInstance* CreateAzureInstance(corvell::ILogger* logger, const char16_t* proxyAddress,
-                                                       const char16_t* proxyUser, const char16_t* proxyPassword) {
+                                                        const char16_t* proxyUser, const char16_t* proxyPassword) {
     using namespace corvell;
     if (curl_global_init(CURL_GLOBAL_DEFAULT) != CURLE_OK) {
         if (logger) logger->LogError(u"Azure client not created: libcurl could not be initialised");

@@ -22,9 +22,7 @@ std::string Lower(std::string s) {
     return s;
 }
 
-bool IsHostChar(char c) {
-    return std::isalnum(static_cast<unsigned char>(c)) || c == '-' || c == '.' || c == '_';
-}
+bool IsHostChar(char c) { return std::isalnum(static_cast<unsigned char>(c)) || c == '-' || c == '.' || c == '_'; }
 
 // Splits "scheme://host[:port][/]" into its parts.
 bool ParseEndpoint(const std::string& endpoint, ConnectionString& out, std::string& error) {
@@ -98,9 +96,10 @@ bool ParseEndpoint(const std::string& endpoint, ConnectionString& out, std::stri
 
 std::string ConnectionString::NamespaceName() const {
     // The first label of a DNS name; an address stays whole.
-    const bool isAddress = std::all_of(host.begin(), host.end(), [](char c) {
-        return std::isdigit(static_cast<unsigned char>(c)) || c == '.' || c == ':';
-    }) || host.find(':') != std::string::npos;
+    const bool isAddress =
+        std::all_of(host.begin(), host.end(),
+                    [](char c) { return std::isdigit(static_cast<unsigned char>(c)) || c == '.' || c == ':'; }) ||
+        host.find(':') != std::string::npos;
     std::string name = isAddress ? host : host.substr(0, host.find('.'));
     if (port != 0) name += ":" + std::to_string(port);
     return Shorten(name);

@@ -54,8 +54,13 @@ std::vector<std::string> SignatureSpellings(std::string_view signature) {
     std::replace(url.begin(), url.end(), '+', '-');
     std::replace(url.begin(), url.end(), '/', '_');
     const std::string encoded = PercentEncode(plain);
-    return {std::string(signature), plain, WithoutPadding(plain), encoded, LowerHexEscapes(encoded),
-            PercentEncode(WithoutPadding(plain)), url};
+    return {std::string(signature),
+            plain,
+            WithoutPadding(plain),
+            encoded,
+            LowerHexEscapes(encoded),
+            PercentEncode(WithoutPadding(plain)),
+            url};
 }
 
 bool StartsWithIgnoringCase(std::string_view text, std::size_t at, std::string_view word) {
@@ -68,8 +73,8 @@ bool StartsWithIgnoringCase(std::string_view text, std::size_t at, std::string_v
 
 // Where a token or a value quoted in a text ends.
 bool IsDelimiter(char c, bool stopAtAmpersand) {
-    return std::isspace(static_cast<unsigned char>(c)) || c == '"' || c == '\'' || c == '<' || c == '>' ||
-           c == ';' || c == ',' || c == ')' || c == ']' || (stopAtAmpersand && c == '&');
+    return std::isspace(static_cast<unsigned char>(c)) || c == '"' || c == '\'' || c == '<' || c == '>' || c == ';' ||
+           c == ',' || c == ')' || c == ']' || (stopAtAmpersand && c == '&');
 }
 
 // Replaces, after every occurrence of word (lower case), what follows it up to

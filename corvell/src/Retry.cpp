@@ -53,20 +53,18 @@ Outcome Classify(const HttpResponse& response) {
     if (response.status == 0) {
         if (response.tlsFailure) return Outcome::Permanent;
         switch (static_cast<CURLcode>(response.curlCode)) {
-            case CURLE_COULDNT_RESOLVE_HOST:
-            case CURLE_COULDNT_RESOLVE_PROXY:
-            case CURLE_COULDNT_CONNECT:
-            case CURLE_OPERATION_TIMEDOUT:
-            case CURLE_SEND_ERROR:
-            case CURLE_RECV_ERROR:
-            case CURLE_GOT_NOTHING:
-            case CURLE_PARTIAL_FILE:
-            case CURLE_WEIRD_SERVER_REPLY:
-            case CURLE_HTTP2:
-            case CURLE_HTTP2_STREAM:
-                return Outcome::Transient;
-            default:
-                return Outcome::Permanent;
+        case CURLE_COULDNT_RESOLVE_HOST:
+        case CURLE_COULDNT_RESOLVE_PROXY:
+        case CURLE_COULDNT_CONNECT:
+        case CURLE_OPERATION_TIMEDOUT:
+        case CURLE_SEND_ERROR:
+        case CURLE_RECV_ERROR:
+        case CURLE_GOT_NOTHING:
+        case CURLE_PARTIAL_FILE:
+        case CURLE_WEIRD_SERVER_REPLY:
+        case CURLE_HTTP2:
+        case CURLE_HTTP2_STREAM: return Outcome::Transient;
+        default: return Outcome::Permanent;
         }
     }
     const long status = response.status;
@@ -84,10 +82,13 @@ Outcome Classify(const HttpResponse& response) {
         return oversized && !quota ? Outcome::TooLarge : Outcome::Permanent;
     }
     switch (status) {
-        case 408: case 429: case 500: case 502: case 503: case 504:
-            return Outcome::Transient;
-        default:
-            return Outcome::Permanent;
+    case 408:
+    case 429:
+    case 500:
+    case 502:
+    case 503:
+    case 504: return Outcome::Transient;
+    default: return Outcome::Permanent;
     }
 }
 

@@ -17,12 +17,12 @@ void PutJsonString(std::string& out, std::u16string_view text) {
     out.push_back('"');
     ForEachCodePoint(text, [&out](char32_t cp) {
         switch (cp) {
-            case '"': out += "\\\""; return;
-            case '\\': out += "\\\\"; return;
-            case '\n': out += "\\n"; return;
-            case '\r': out += "\\r"; return;
-            case '\t': out += "\\t"; return;
-            default: break;
+        case '"': out += "\\\""; return;
+        case '\\': out += "\\\\"; return;
+        case '\n': out += "\\n"; return;
+        case '\r': out += "\\r"; return;
+        case '\t': out += "\\t"; return;
+        default: break;
         }
         if (cp < 0x20) {
             out += "\\u00";
@@ -41,20 +41,14 @@ void PutJsonString(std::string& out, std::u16string_view text) {
 void PutXmlText(std::string& out, std::u16string_view text, bool attribute) {
     ForEachCodePoint(text, [&out, attribute](char32_t cp) {
         switch (cp) {
-            case '&': out += "&amp;"; return;
-            case '<': out += "&lt;"; return;
-            case '>': out += "&gt;"; return;
-            case '"':
-                out += attribute ? "&quot;" : "\"";
-                return;
-            case '\r': out += "&#13;"; return;
-            case '\n':
-                out += attribute ? "&#10;" : "\n";
-                return;
-            case '\t':
-                out += attribute ? "&#9;" : "\t";
-                return;
-            default: break;
+        case '&': out += "&amp;"; return;
+        case '<': out += "&lt;"; return;
+        case '>': out += "&gt;"; return;
+        case '"': out += attribute ? "&quot;" : "\""; return;
+        case '\r': out += "&#13;"; return;
+        case '\n': out += attribute ? "&#10;" : "\n"; return;
+        case '\t': out += attribute ? "&#9;" : "\t"; return;
+        default: break;
         }
         if (cp < 0x20 || cp == 0xFFFE || cp == 0xFFFF) cp = 0xFFFD;
         PutUtf8(out, cp);
@@ -222,9 +216,9 @@ std::size_t RowBuffer::RowBytes(std::size_t index) const {
 std::size_t RowBuffer::Add(const Row& row) {
     const std::size_t before = m_bytes.size();
     switch (m_format) {
-        case Format::Json: AppendJsonRow(m_bytes, row); break;
-        case Format::Xml: AppendXmlRow(m_bytes, row); break;
-        case Format::Bond: AppendBondRow(m_bytes, row); break;
+    case Format::Json: AppendJsonRow(m_bytes, row); break;
+    case Format::Xml: AppendXmlRow(m_bytes, row); break;
+    case Format::Bond: AppendBondRow(m_bytes, row); break;
     }
     m_ends.push_back(m_bytes.size());
     return m_bytes.size() - before;
@@ -245,18 +239,18 @@ std::size_t RowBuffer::MessageSize(std::size_t first, std::size_t last) const {
     const std::size_t rows = m_ends[last - 1] - start;
     const std::size_t count = last - first;
     switch (m_format) {
-        case Format::Json: return rows + count + 1;  // brackets and commas
-        case Format::Xml: return kXmlPrefix.size() + rows + kXmlSuffix.size();
-        case Format::Bond: return sizeof kBondMessagePrefix + bond::VarintSize(count) + rows + 1;
+    case Format::Json: return rows + count + 1;  // brackets and commas
+    case Format::Xml: return kXmlPrefix.size() + rows + kXmlSuffix.size();
+    case Format::Bond: return sizeof kBondMessagePrefix + bond::VarintSize(count) + rows + 1;
     }
     return rows;
 }
 
 std::size_t RowBuffer::SingleRowMessageSize(std::size_t rowBytes) const {
     switch (m_format) {
-        case Format::Json: return rowBytes + 2;
-        case Format::Xml: return kXmlPrefix.size() + rowBytes + kXmlSuffix.size();
-        case Format::Bond: return sizeof kBondMessagePrefix + 1 + rowBytes + 1;
+    case Format::Json: return rowBytes + 2;
+    case Format::Xml: return kXmlPrefix.size() + rowBytes + kXmlSuffix.size();
+    case Format::Bond: return sizeof kBondMessagePrefix + 1 + rowBytes + 1;
     }
     return rowBytes;
 }
@@ -265,48 +259,48 @@ std::string RowBuffer::Compose(std::size_t first, std::size_t last) const {
     std::string body;
     body.reserve(MessageSize(first, last));
     switch (m_format) {
-        case Format::Json:
-            body.push_back('[');
-            for (std::size_t i = first; i < last; ++i) {
-                if (i != first) body.push_back(',');
-                const std::size_t start = i == 0 ? 0 : m_ends[i - 1];
-                body.append(m_bytes, start, m_ends[i] - start);
-            }
-            body.push_back(']');
-            break;
-        case Format::Xml: {
-            const std::size_t start = first == 0 ? 0 : m_ends[first - 1];
-            body += kXmlPrefix;
-            body.append(m_bytes, start, m_ends[last - 1] - start);
-            body += kXmlSuffix;
-            break;
+    case Format::Json:
+        body.push_back('[');
+        for (std::size_t i = first; i < last; ++i) {
+            if (i != first) body.push_back(',');
+            const std::size_t start = i == 0 ? 0 : m_ends[i - 1];
+            body.append(m_bytes, start, m_ends[i] - start);
         }
-        case Format::Bond: {
-            const std::size_t start = first == 0 ? 0 : m_ends[first - 1];
-            body.append(kBondMessagePrefix, sizeof kBondMessagePrefix);
-            bond::PutVarint(body, last - first);
-            body.append(m_bytes, start, m_ends[last - 1] - start);
-            body.push_back(bond::kStop);  // end of struct Rows
-            break;
-        }
+        body.push_back(']');
+        break;
+    case Format::Xml: {
+        const std::size_t start = first == 0 ? 0 : m_ends[first - 1];
+        body += kXmlPrefix;
+        body.append(m_bytes, start, m_ends[last - 1] - start);
+        body += kXmlSuffix;
+        break;
+    }
+    case Format::Bond: {
+        const std::size_t start = first == 0 ? 0 : m_ends[first - 1];
+        body.append(kBondMessagePrefix, sizeof kBondMessagePrefix);
+        bond::PutVarint(body, last - first);
+        body.append(m_bytes, start, m_ends[last - 1] - start);
+        body.push_back(bond::kStop);  // end of struct Rows
+        break;
+    }
     }
     return body;
 }
 
 const char* RowBuffer::ContentType() const {
     switch (m_format) {
-        case Format::Json: return "application/json; charset=utf-8";
-        case Format::Xml: return "application/xml; charset=utf-8";
-        case Format::Bond: return "application/x-bond-compact-binary";
+    case Format::Json: return "application/json; charset=utf-8";
+    case Format::Xml: return "application/xml; charset=utf-8";
+    case Format::Bond: return "application/x-bond-compact-binary";
     }
     return "application/octet-stream";
 }
 
 const char* RowBuffer::FormatName() const {
     switch (m_format) {
-        case Format::Json: return "JSON";
-        case Format::Xml: return "XML";
-        case Format::Bond: return "BOND";
+    case Format::Json: return "JSON";
+    case Format::Xml: return "XML";
+    case Format::Bond: return "BOND";
     }
     return "";
 }

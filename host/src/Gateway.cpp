@@ -56,8 +56,9 @@ void GatewayError(const std::string& text) {
 bool CheckSettingsFile(const std::string& path, std::string& error) {
     struct stat info = {};
     if (stat(path.c_str(), &info) != 0) {
-        error = "settings file '" + path + "' " +
-                (errno == ENOENT ? std::string("does not exist") : "cannot be read: " + std::string(std::strerror(errno)));
+        error =
+            "settings file '" + path + "' " +
+            (errno == ENOENT ? std::string("does not exist") : "cannot be read: " + std::string(std::strerror(errno)));
         return false;
     }
     if (!S_ISREG(info.st_mode)) {
@@ -127,7 +128,8 @@ bool CGateway::Start() {
         AttachRuntimeSource();
     } else {
         if (m_options.simulateDelay > 0) {
-            GatewaySay("the runtime stand-in starts in " + std::to_string(Milliseconds(m_options.simulateDelay)) + " ms");
+            GatewaySay("the runtime stand-in starts in " + std::to_string(Milliseconds(m_options.simulateDelay)) +
+                       " ms");
             m_runtimeTimer.start(Milliseconds(m_options.simulateDelay));
         } else if (!StartRuntime()) {
             return false;

@@ -84,8 +84,8 @@ private:
     QTimer m_runtimeTimer;
     QElapsedTimer m_intervalClock;  // since the last status line
 
-    bool m_bRunning = false;         // init returned 1 and dll_exit has not been called since
-    bool m_bInInit = false;          // inside the init call: its closing 1026 is no cycle
+    bool m_bRunning = false;  // init returned 1 and dll_exit has not been called since
+    bool m_bInInit = false;   // inside the init call: its closing 1026 is no cycle
     bool m_bStopping = false;
     bool m_bSaidNoRuntime = false;   // "no runtime yet" is said once per wait
     bool m_bReloadPending = false;   // exec_action returned, its WM_GATEWAY_RELOAD_DONE not yet seen
@@ -93,7 +93,7 @@ private:
     bool m_bRestartFailed = false;   // a 1126 arrived since the last exec_action
     bool m_bMetricsFailing = false;  // the last metrics write failed (reported once)
     unsigned m_nAttempt = 0;
-    DWORD m_dwRuntimeSource = 0;     // the local-socket source of the running-object table, 0 when none
+    DWORD m_dwRuntimeSource = 0;  // the local-socket source of the running-object table, 0 when none
 };
 
 // A line on standard output, with the local time in front.

@@ -14,8 +14,8 @@ struct OptionInfo {
 };
 
 constexpr OptionInfo kOptions[] = {
-    {"--ini", true, true},           {"--simulate", true, true},        {"--simulate-delay", true, false},
-    {"--module", true, true},        {"--duration", true, false},       {"--status-interval", true, false},
+    {"--ini", true, true},           {"--simulate", true, true},  {"--simulate-delay", true, false},
+    {"--module", true, true},        {"--duration", true, false}, {"--status-interval", true, false},
     {"--metrics-file", true, false},
 };
 

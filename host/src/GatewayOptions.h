@@ -15,7 +15,7 @@ struct GatewayOptions {
     double duration = 0;       // --duration: seconds to run, 0 until a signal
     double statusInterval = 10;
     std::string metricsFile;
-    std::string modulePath;    // --module; empty: libSkyvane.so beside the program
+    std::string modulePath;  // --module; empty: libSkyvane.so beside the program
 };
 
 // Reads the arguments after the program name. False with one line saying what

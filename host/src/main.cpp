@@ -69,11 +69,10 @@ int main(int argc, char** argv) {
     if (options.command == GatewayCommand::Configure) application = std::make_unique<QApplication>(argc, argv);
     else application = std::make_unique<QCoreApplication>(argc, argv);
 
-    const CString modulePath = options.modulePath.empty()
-                                   ? CString::FromUtf8(QDir(QCoreApplication::applicationDirPath())
-                                                           .filePath("libSkyvane.so")
-                                                           .toStdString())
-                                   : CString::FromUtf8(options.modulePath);
+    const CString modulePath =
+        options.modulePath.empty()
+            ? CString::FromUtf8(QDir(QCoreApplication::applicationDirPath()).filePath("libSkyvane.so").toStdString())
+            : CString::FromUtf8(options.modulePath);
     CSkyvaneModule module;
     CString error;
     if (!module.Load(modulePath, error)) {

@@ -32,7 +32,8 @@ bool AfxLoadString(UINT id, CString& text) {
     std::lock_guard<std::mutex> guard(g_tablesLock);
     for (auto table = g_tables.rbegin(); table != g_tables.rend(); ++table) {
         const STRINGTABLE_ENTRY* end = table->entries + table->count;
-        const STRINGTABLE_ENTRY* hit = std::find_if(table->entries, end, [&](const STRINGTABLE_ENTRY& e) { return e.id == id; });
+        const STRINGTABLE_ENTRY* hit =
+            std::find_if(table->entries, end, [&](const STRINGTABLE_ENTRY& e) { return e.id == id; });
         if (hit != end) {
             text = hit->text;
             return true;

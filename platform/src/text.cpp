@@ -66,10 +66,19 @@ Utf8Step DecodeUtf8At(std::string_view in, size_t i) {
     if (b0 < 0x80) return {true, 1, b0};
     int extra = 0;
     char32_t cp = 0, min = 0;
-    if ((b0 & 0xE0) == 0xC0) { extra = 1; cp = b0 & 0x1F; min = 0x80; }
-    else if ((b0 & 0xF0) == 0xE0) { extra = 2; cp = b0 & 0x0F; min = 0x800; }
-    else if ((b0 & 0xF8) == 0xF0) { extra = 3; cp = b0 & 0x07; min = 0x10000; }
-    else return {false, 1, 0};
+    if ((b0 & 0xE0) == 0xC0) {
+        extra = 1;
+        cp = b0 & 0x1F;
+        min = 0x80;
+    } else if ((b0 & 0xF0) == 0xE0) {
+        extra = 2;
+        cp = b0 & 0x0F;
+        min = 0x800;
+    } else if ((b0 & 0xF8) == 0xF0) {
+        extra = 3;
+        cp = b0 & 0x07;
+        min = 0x10000;
+    } else return {false, 1, 0};
     size_t j = 1;
     for (; j <= static_cast<size_t>(extra) && i + j < in.size(); ++j) {
         const auto b = static_cast<unsigned char>(in[i + j]);
@@ -184,7 +193,9 @@ CString& CString::MakeLower() {
     return *this;
 }
 
-static bool IsBlank(char16_t c) { return c == u' ' || c == u'\t' || c == u'\r' || c == u'\n' || c == u'\v' || c == u'\f'; }
+static bool IsBlank(char16_t c) {
+    return c == u' ' || c == u'\t' || c == u'\r' || c == u'\n' || c == u'\v' || c == u'\f';
+}
 
 CString& CString::TrimLeft() {
     size_t i = 0;
@@ -249,14 +260,22 @@ struct Spec {
 
 void Pad(std::u16string& out, std::u16string_view body, const Spec& spec, bool numeric) {
     const size_t width = spec.width > 0 ? static_cast<size_t>(spec.width) : 0;
-    if (body.size() >= width) { out += body; return; }
+    if (body.size() >= width) {
+        out += body;
+        return;
+    }
     const size_t fill = width - body.size();
-    if (spec.left) { out += body; out.append(fill, u' '); return; }
+    if (spec.left) {
+        out += body;
+        out.append(fill, u' ');
+        return;
+    }
     if (numeric && spec.zero && spec.precision < 0) {
         // Zeros go between the sign or 0x prefix and the digits.
         size_t prefix = 0;
         if (!body.empty() && (body[0] == u'-' || body[0] == u'+' || body[0] == u' ')) prefix = 1;
-        if (body.size() >= prefix + 2 && body[prefix] == u'0' && (body[prefix + 1] == u'x' || body[prefix + 1] == u'X')) prefix += 2;
+        if (body.size() >= prefix + 2 && body[prefix] == u'0' && (body[prefix + 1] == u'x' || body[prefix + 1] == u'X'))
+            prefix += 2;
         out += body.substr(0, prefix);
         out.append(fill, u'0');
         out += body.substr(prefix);
@@ -269,7 +288,10 @@ void Pad(std::u16string& out, std::u16string_view body, const Spec& spec, bool n
 std::u16string Digits(unsigned long long v, unsigned base, bool upper) {
     const char* set = upper ? "0123456789ABCDEF" : "0123456789abcdef";
     std::u16string d;
-    do { d += static_cast<char16_t>(set[v % base]); v /= base; } while (v);
+    do {
+        d += static_cast<char16_t>(set[v % base]);
+        v /= base;
+    } while (v);
     std::reverse(d.begin(), d.end());
     return d;
 }
@@ -353,10 +375,14 @@ void FormatPointer(std::u16string& out, const FormatArg& a, const Spec& spec) {
 
 void FormatOne(std::u16string& out, const FormatArg& a, const Spec& spec) {
     switch (spec.conv) {
-    case 's': case 'S': case 'c': case 'C': {
+    case 's':
+    case 'S':
+    case 'c':
+    case 'C': {
         if (a.kind == FormatArg::Kind::Text16 || a.kind == FormatArg::Kind::Text8 || a.kind == FormatArg::Kind::Char) {
             std::u16string text = TextOf(a);
-            if (spec.precision >= 0 && text.size() > static_cast<size_t>(spec.precision)) text.resize(static_cast<size_t>(spec.precision));
+            if (spec.precision >= 0 && text.size() > static_cast<size_t>(spec.precision))
+                text.resize(static_cast<size_t>(spec.precision));
             Pad(out, text, spec, false);
         } else if (spec.conv == 'c' || spec.conv == 'C') {
             Pad(out, std::u16string(1, static_cast<char16_t>(AsUnsigned(a))), spec, false);
@@ -369,19 +395,34 @@ void FormatOne(std::u16string& out, const FormatArg& a, const Spec& spec) {
         }
         return;
     }
-    case 'd': case 'i': case 'u': case 'x': case 'X': case 'o':
-        if (a.kind == FormatArg::Kind::Text16 || a.kind == FormatArg::Kind::Text8) { Pad(out, TextOf(a), spec, false); return; }
+    case 'd':
+    case 'i':
+    case 'u':
+    case 'x':
+    case 'X':
+    case 'o':
+        if (a.kind == FormatArg::Kind::Text16 || a.kind == FormatArg::Kind::Text8) {
+            Pad(out, TextOf(a), spec, false);
+            return;
+        }
         FormatInteger(out, a, spec);
         return;
-    case 'e': case 'E': case 'f': case 'F': case 'g': case 'G': case 'a': case 'A':
-        if (a.kind == FormatArg::Kind::Text16 || a.kind == FormatArg::Kind::Text8) { Pad(out, TextOf(a), spec, false); return; }
+    case 'e':
+    case 'E':
+    case 'f':
+    case 'F':
+    case 'g':
+    case 'G':
+    case 'a':
+    case 'A':
+        if (a.kind == FormatArg::Kind::Text16 || a.kind == FormatArg::Kind::Text8) {
+            Pad(out, TextOf(a), spec, false);
+            return;
+        }
         FormatFloating(out, a, spec);
         return;
-    case 'p':
-        FormatPointer(out, a, spec);
-        return;
-    default:
-        return;
+    case 'p': FormatPointer(out, a, spec); return;
+    default: return;
     }
 }
 
@@ -399,9 +440,15 @@ std::u16string CString::FormatList(const char16_t* format, const FormatArg* args
     size_t next = 0;
     auto take = [&]() -> const FormatArg* { return next < count ? &args[next++] : nullptr; };
     for (const char16_t* p = format; *p; ++p) {
-        if (*p != u'%') { out += *p; continue; }
+        if (*p != u'%') {
+            out += *p;
+            continue;
+        }
         const char16_t* start = p++;
-        if (*p == u'%') { out += u'%'; continue; }
+        if (*p == u'%') {
+            out += u'%';
+            continue;
+        }
         Spec spec;
         for (;; ++p) {
             if (*p == u'-') spec.left = true;
@@ -414,7 +461,10 @@ std::u16string CString::FormatList(const char16_t* format, const FormatArg* args
         if (*p == u'*') {
             const FormatArg* w = take();
             spec.width = w ? IntOf(*w) : 0;
-            if (spec.width < 0) { spec.left = true; spec.width = -spec.width; }
+            if (spec.width < 0) {
+                spec.left = true;
+                spec.width = -spec.width;
+            }
             ++p;
         } else {
             while (*p >= u'0' && *p <= u'9') spec.width = std::min(spec.width * 10 + (*p++ - u'0'), 4096);
@@ -431,9 +481,14 @@ std::u16string CString::FormatList(const char16_t* format, const FormatArg* args
             }
         }
         // Length modifiers are accepted and ignored: the argument's own type decides.
-        while (*p == u'h' || *p == u'l' || *p == u'L' || *p == u'z' || *p == u'j' || *p == u't' || *p == u'q' || *p == u'w') ++p;
+        while (*p == u'h' || *p == u'l' || *p == u'L' || *p == u'z' || *p == u'j' || *p == u't' || *p == u'q' ||
+               *p == u'w')
+            ++p;
         if (p[0] == u'I' && ((p[1] == u'6' && p[2] == u'4') || (p[1] == u'3' && p[2] == u'2'))) p += 3;
-        if (!*p) { out.append(start, p); break; }
+        if (!*p) {
+            out.append(start, p);
+            break;
+        }
         spec.conv = static_cast<char>(*p < 0x80 ? *p : '?');
         if (const FormatArg* a = take()) FormatOne(out, *a, spec);
     }

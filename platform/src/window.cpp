@@ -44,7 +44,9 @@ class MessageEvent : public QEvent {
 public:
     MessageEvent(UINT m, WPARAM w, LPARAM l, std::shared_ptr<SendState> s = nullptr)
         : QEvent(kMessageEvent), message(m), wParam(w), lParam(l), send(std::move(s)) {}
-    ~MessageEvent() override { if (send) send->Finish(0); }
+    ~MessageEvent() override {
+        if (send) send->Finish(0);
+    }
     UINT message;
     WPARAM wParam;
     LPARAM lParam;
@@ -127,7 +129,7 @@ private:
     }
 
     std::atomic<CWnd*> m_window;  // null once the window is gone
-    int m_depth = 0;  // handlers of this window currently running (nested loops)
+    int m_depth = 0;              // handlers of this window currently running (nested loops)
     std::map<UINT_PTR, int> m_timers;
 };
 
@@ -141,7 +143,6 @@ struct WindowRecord {
 // simply finds nothing.
 std::unordered_map<HWND, WindowRecord> g_windows;
 std::uintptr_t g_nextHandle = 0x10000;
-
 
 }  // namespace
 
@@ -184,9 +185,13 @@ LRESULT CWnd::WindowProc(UINT message, WPARAM wParam, LPARAM lParam) { return De
 
 LRESULT CWnd::DefWindowProc(UINT, WPARAM, LPARAM) { return 0; }
 
-bool CWnd::PostMessage(UINT message, WPARAM wParam, LPARAM lParam) { return ::PostMessage(m_hWnd, message, wParam, lParam); }
+bool CWnd::PostMessage(UINT message, WPARAM wParam, LPARAM lParam) {
+    return ::PostMessage(m_hWnd, message, wParam, lParam);
+}
 
-LRESULT CWnd::SendMessage(UINT message, WPARAM wParam, LPARAM lParam) { return ::SendMessage(m_hWnd, message, wParam, lParam); }
+LRESULT CWnd::SendMessage(UINT message, WPARAM wParam, LPARAM lParam) {
+    return ::SendMessage(m_hWnd, message, wParam, lParam);
+}
 
 UINT_PTR CWnd::SetTimer(UINT_PTR id, UINT elapseMs, void*) {
     std::lock_guard<std::mutex> guard(g_windowsLock);

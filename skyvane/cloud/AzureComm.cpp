@@ -25,8 +25,8 @@ CAzureComm::~CAzureComm() { Exit(); }
 bool CAzureComm::Init(const CString& strProxyDomain, const CString& strProxyUser, const CString& strProxyPassword) {
     if (!m_hWrapper) {
         // The directory text ends in "/": the file name is appended directly.
-        const CString dir =
-            m_strWrapperDir.IsEmpty() ? VX_DirManager::GetModuleDir(&g_addressInModule) : m_strWrapperDir;
+        const CString dir = m_strWrapperDir.IsEmpty() ? VX_DirManager::GetModuleDir(&g_addressInModule)
+                                                      : m_strWrapperDir;
         m_hWrapper = LoadLibrary(dir + kWrapperFileName);
         if (m_hWrapper) {
             m_pfnCreate = reinterpret_cast<PFN_CreateAzureInstance>(GetProcAddress(m_hWrapper, "CreateAzureInstance"));
@@ -71,8 +71,7 @@ void CAzureComm::Exit() {
     }
 }
 
-bool CAzureComm::BeginOnlineRows(const CString& strConnection, const CString& strQueue, bool bEventHub,
-                                 int nFormat) {
+bool CAzureComm::BeginOnlineRows(const CString& strConnection, const CString& strQueue, bool bEventHub, int nFormat) {
     return m_pInstance && m_pInstance->BeginOnlineRows(strConnection, strQueue, bEventHub, nFormat);
 }
 

@@ -49,6 +49,6 @@ private:
     PFN_DestroyAzureInstance m_pfnDestroy = nullptr;
     HMODULE m_hWrapper = nullptr;
     corvell::IAzureInstance* m_pInstance = nullptr;
-    CString m_strWrapperDir;  // empty: this module's directory
+    CString m_strWrapperDir;   // empty: this module's directory
     std::u16string m_project;  // the project part of the row being added
 };

@@ -13,10 +13,10 @@ public:
     CConnection& operator=(const CConnection&) = default;
     ~CConnection() override = default;
 
-    CString m_strConnection;  // Azure connection string
-    CString m_strQueue;       // Service Bus queue or Event Hub name
-    bool m_bEventHub = false; // false: Service Bus queue
-    int m_nFormat = 0;        // 0 XML, 1 JSON, 2 BOND; kept as read
+    CString m_strConnection;   // Azure connection string
+    CString m_strQueue;        // Service Bus queue or Event Hub name
+    bool m_bEventHub = false;  // false: Service Bus queue
+    int m_nFormat = 0;         // 0 XML, 1 JSON, 2 BOND; kept as read
 };
 
 // Variable key -> item (owned; keys compared exactly) and the targets in export order (owned).
@@ -32,8 +32,8 @@ public:
 
     CVarItemMap m_mapVariables;
     CConnectionList m_lstConnections;
-    int m_nIntegrityPeriod = 5;   // seconds
+    int m_nIntegrityPeriod = 5;  // seconds
     CString m_strProxyDomain;
     CString m_strProxyUser;
-    CString m_strProxyPassword;   // enciphered, as hexadecimal text
+    CString m_strProxyPassword;  // enciphered, as hexadecimal text
 };

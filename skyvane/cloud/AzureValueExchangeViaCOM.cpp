@@ -75,10 +75,11 @@ void CAzureValueExchangeViaCOM::OnProjectActiveFailed(const CString& strProject)
 }
 
 void CAzureValueExchangeViaCOM::OnValuesDiscarded(const CString& strProject, int nCount) {
-    m_pMain->LogError(
-        CString::Formatted(u"Project %s: %d queued value changes were discarded unsent and are lost", strProject, nCount));
+    m_pMain->LogError(CString::Formatted(u"Project %s: %d queued value changes were discarded unsent and are lost",
+                                         strProject, nCount));
 }
 
 void CAzureValueExchangeViaCOM::OnValueQueueFull(CString strProject, DWORD dwId) {
-    m_pMain->LogError(CString::Formatted(u"Value change queue full: Value change for id:%u of project:%s lost!", dwId, strProject));
+    m_pMain->LogError(
+        CString::Formatted(u"Value change queue full: Value change for id:%u of project:%s lost!", dwId, strProject));
 }

@@ -38,5 +38,5 @@ public:
 
 private:
     VX_KeepRefCmdPtr<CMultipleOnlVarsPerPrj> m_pLink;  // window thread only
-    IMainAzureAccess* m_pMain;                          // not owned
+    IMainAzureAccess* m_pMain;                         // not owned
 };

@@ -90,8 +90,8 @@ bool CVarItemRtData::Update(const VARIANT* value, DWORD statusLow, DWORD statusH
     const double halfWidth = std::max(1.0, std::fabs(m_dValue)) * DBL_EPSILON;
     // Equal numbers are inside even where the band is not a number (infinities).
     const bool inside = number == m_dValue || (number >= m_dValue - halfWidth && number <= m_dValue + halfWidth);
-    const bool changed = text != m_strValue || !inside || statusLow != m_dwStatusLow ||
-                         statusHigh != m_dwStatusHigh || !m_bValid;
+    const bool changed = text != m_strValue || !inside || statusLow != m_dwStatusLow || statusHigh != m_dwStatusHigh ||
+                         !m_bValid;
     if (!changed) return false;
     return SetValue(text, number, isText, statusLow, statusHigh, time);
 }
@@ -102,7 +102,7 @@ bool CVarItemRtData::SetValue(const CString& text, double number, bool isText, D
     // no value is ever exported with the time of the report before it.
     SYSTEMTIME st{};
     if (!time || !ConvertDATE2Systemtime(*time, &st)) return false;  // no usable time stamp
-    LONGLONG seconds = 0;  // 0 for a year before 1900
+    LONGLONG seconds = 0;                                            // 0 for a year before 1900
     if (st.wYear >= 1900 && !LocalTimeToSeconds(st, seconds)) return false;
 
     CSingleLock lock(&m_cs, true);

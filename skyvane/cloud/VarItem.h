@@ -53,8 +53,7 @@ public:
     // the system decides for that date) must lie from 1970-01-01 00:00:00 to
     // 3000-12-31 23:59:59 UTC. A time stamp outside that, or none at all,
     // stores nothing and gives false.
-    bool SetValue(const CString& text, double number, bool isText, DWORD statusLow, DWORD statusHigh,
-                  const DATE* time);
+    bool SetValue(const CString& text, double number, bool isText, DWORD statusLow, DWORD statusHigh, const DATE* time);
 
     CCriticalSection m_cs;  // guards every field of the value
 };
@@ -73,5 +72,5 @@ public:
     static void SplitKey(const CString& key, CString& project, CString& variable);
 
     const std::unique_ptr<CVarItemRtData> m_pRtData;  // never null
-    CString m_strName;                // the variable key: project "#" variable
+    CString m_strName;                                // the variable key: project "#" variable
 };

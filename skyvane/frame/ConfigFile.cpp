@@ -94,9 +94,11 @@ bool WriteConfig(const CString& path, const CAzureConfig& config) {
 
     written = 0;
     for (const CConnection* connection : config.m_lstConnections) {
-        ok = VX_WritePrivateProfileString(kConnections, Key(u"CONN_", written), connection->m_strConnection, path) && ok;
+        ok = VX_WritePrivateProfileString(kConnections, Key(u"CONN_", written), connection->m_strConnection, path) &&
+             ok;
         ok = VX_WritePrivateProfileString(kConnections, Key(u"QUEUE_", written), connection->m_strQueue, path) && ok;
-        ok = VX_WritePrivateProfileInt(kConnections, Key(u"MODE_", written), connection->m_bEventHub ? 1 : 0, path) && ok;
+        ok = VX_WritePrivateProfileInt(kConnections, Key(u"MODE_", written), connection->m_bEventHub ? 1 : 0, path) &&
+             ok;
         ok = VX_WritePrivateProfileInt(kConnections, Key(u"FORMAT_", written), connection->m_nFormat, path) && ok;
         ++written;
     }

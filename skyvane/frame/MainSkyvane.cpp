@@ -175,9 +175,9 @@ LRESULT CMainSkyvane::SubscribeVariables() {
 // A heading by the number of names, then at most ten names, the last refused first.
 void CMainSkyvane::ShowUnknownVariables(const CStringArray& refused) {
     const int count = refused.GetCount();
-    const UINT heading = count == 1                     ? IDS_UNKNOWN_VARIABLE
+    const UINT heading = count == 1                    ? IDS_UNKNOWN_VARIABLE
                          : count > kListedUnknownNames ? IDS_MANY_UNKNOWN_VARIABLES
-                                                        : IDS_UNKNOWN_VARIABLES;
+                                                       : IDS_UNKNOWN_VARIABLES;
     CString text;
     AfxLoadString(heading, text);
     for (int i = std::min(count, kListedUnknownNames) - 1; i >= 0; --i) {
@@ -196,20 +196,16 @@ bool CMainSkyvane::RequestVariableCheck() {
 
 LRESULT CMainSkyvane::WindowProc(UINT message, WPARAM wParam, LPARAM lParam) {
     switch (message) {
-    case WM_TIMER:
-        OnTick();
-        break;
+    case WM_TIMER: OnTick(); break;
     case WM_DESTROY: {
         const LRESULT result = DefWindowProc(message, wParam, lParam);
         KillTimer(kTickTimerId);
         return result;
     }
-    case WM_SKYVANE_CHECK_VARIABLES:
-        return CheckVariables(wParam, lParam);
+    case WM_SKYVANE_CHECK_VARIABLES: return CheckVariables(wParam, lParam);
     case WM_SKYVANE_RUN_ON_WINDOW_THREAD:
         return lParam ? (*reinterpret_cast<const std::function<int()>*>(lParam))() : 0;
-    default:
-        break;
+    default: break;
     }
     return DefWindowProc(message, wParam, lParam);
 }

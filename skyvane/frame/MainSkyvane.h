@@ -84,15 +84,15 @@ private:
     int CountRows(const CLstOwner<CVarItem>& batch, bool integrity) const;
     static void AddRow(CAzureComm& comm, const CString& key, const SVarItemValue& data, RowCounts& counts);
 
-    CAzureConfig m_config;  // written on the window thread only while the worker is stopped
+    CAzureConfig m_config;         // written on the window thread only while the worker is stopped
     int m_nTickState = kTickIdle;  // window thread only
     std::unique_ptr<CAzureValueExchangeViaCOM> m_pBridge;  // window thread only
-    CLstOwner<CVarItem> m_lstValueQueue;  // snapshots of changed items, oldest first
-    CCriticalSection m_csQueue;  // guards m_lstValueQueue
-    std::atomic<int> m_nQueued{0};  // entries of m_lstValueQueue, for the worker's unlocked test
-    int m_nQueueLimit = 0x7FFFFFFF;  // window thread only
-    std::atomic<HWND> m_hHostWnd{nullptr};  // the context copy's host window, read by the worker
-    VX_CRefCnt m_checkBusy;  // held while a variable check runs (re-entry through message boxes)
+    CLstOwner<CVarItem> m_lstValueQueue;                   // snapshots of changed items, oldest first
+    CCriticalSection m_csQueue;                            // guards m_lstValueQueue
+    std::atomic<int> m_nQueued{0};                         // entries of m_lstValueQueue, for the worker's unlocked test
+    int m_nQueueLimit = 0x7FFFFFFF;                        // window thread only
+    std::atomic<HWND> m_hHostWnd{nullptr};                 // the context copy's host window, read by the worker
+    VX_CRefCnt m_checkBusy;        // held while a variable check runs (re-entry through message boxes)
     bool m_bCheckRefused = false;  // a nested check was refused: check again when the outer one ends
-    VX_CThread m_worker;  // declared last: ended before anything it reads goes
+    VX_CThread m_worker;           // declared last: ended before anything it reads goes
 };

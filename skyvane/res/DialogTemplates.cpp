@@ -53,18 +53,22 @@ constexpr DlgControl kConnectionControls[] = {
 
 }  // namespace
 
-const DlgTemplate kKonfigDialog = {IDD_KONFIG, u"Settings", u"MS Sans Serif", 8, 572, 380,
-                                   kKonfigControls, sizeof(kKonfigControls) / sizeof(kKonfigControls[0])};
+const DlgTemplate kKonfigDialog = {
+    IDD_KONFIG, u"Settings", u"MS Sans Serif", 8,
+    572,        380,         kKonfigControls,  sizeof(kKonfigControls) / sizeof(kKonfigControls[0])};
 
-const DlgTemplate kConnectionDialog = {IDD_CONNECTION, u"MS Azure Connection Settings", u"MS Shell Dlg", 8, 256, 152,
+const DlgTemplate kConnectionDialog = {IDD_CONNECTION,
+                                       u"MS Azure Connection Settings",
+                                       u"MS Shell Dlg",
+                                       8,
+                                       256,
+                                       152,
                                        kConnectionControls,
                                        sizeof(kConnectionControls) / sizeof(kConnectionControls[0])};
 
 // 2005 = 0x07D5, add string = 0x0403, lengths little-endian.
 const unsigned char kConnectionDialogInit[] = {
-    0xD5, 0x07, 0x03, 0x04, 4, 0, 0, 0, 'X', 'M', 'L', 0,
-    0xD5, 0x07, 0x03, 0x04, 6, 0, 0, 0, 'J', 'S', 'O', 'N', 0, 0,
-    0xD5, 0x07, 0x03, 0x04, 6, 0, 0, 0, 'B', 'O', 'N', 'D', 0, 0,
-    0, 0,
+    0xD5, 0x07, 0x03, 0x04, 4, 0,    0,    0,    'X',  'M', 'L', 0, 0xD5, 0x07, 0x03, 0x04, 6,   0, 0, 0, 'J',
+    'S',  'O',  'N',  0,    0, 0xD5, 0x07, 0x03, 0x04, 6,   0,   0, 0,    'B',  'O',  'N',  'D', 0, 0, 0, 0,
 };
 const std::size_t kConnectionDialogInitSize = sizeof(kConnectionDialogInit);

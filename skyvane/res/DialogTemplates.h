@@ -8,7 +8,7 @@
 #include <cstddef>
 
 enum class DlgControlKind {
-    ListView,     // report view
+    ListView,  // report view
     PushButton,
     DefPushButton,
     Label,
@@ -22,12 +22,12 @@ enum class DlgControlKind {
 // Control styles that matter here.
 enum DlgControlStyle : UINT {
     kStyleNone = 0,
-    kStyleSingleSel = 1u << 0,   // list view: one selected item at most
-    kStyleAutoHScroll = 1u << 1, // edit: scrolls horizontally
-    kStyleNumber = 1u << 2,      // edit: digits only
-    kStylePassword = 1u << 3,    // edit: shows no characters
-    kStyleGroup = 1u << 4,       // radio button: starts a group
-    kStyleVScroll = 1u << 5,     // combo box: vertical scroll bar
+    kStyleSingleSel = 1u << 0,    // list view: one selected item at most
+    kStyleAutoHScroll = 1u << 1,  // edit: scrolls horizontally
+    kStyleNumber = 1u << 2,       // edit: digits only
+    kStylePassword = 1u << 3,     // edit: shows no characters
+    kStyleGroup = 1u << 4,        // radio button: starts a group
+    kStyleVScroll = 1u << 5,      // combo box: vertical scroll bar
 };
 
 struct DlgControl {
@@ -43,7 +43,7 @@ struct DlgTemplate {
     const char16_t* caption;
     const char16_t* fontFace;
     int fontPoints;
-    int cx, cy;  // dialog units
+    int cx, cy;                  // dialog units
     const DlgControl* controls;  // tab order
     std::size_t controlCount;
 };

@@ -13,10 +13,13 @@ namespace {
 
 bool NumberOfVariant(const VARIANT& v, double* number) {
     switch (v.vt) {
-    case VT_R8: case VT_DATE: *number = v.dblVal; return true;
+    case VT_R8:
+    case VT_DATE: *number = v.dblVal; return true;
     case VT_R4: *number = v.fltVal; return true;
-    case VT_I4: case VT_INT: *number = v.lVal; return true;
-    case VT_UI4: case VT_UINT: *number = v.ulVal; return true;
+    case VT_I4:
+    case VT_INT: *number = v.lVal; return true;
+    case VT_UI4:
+    case VT_UINT: *number = v.ulVal; return true;
     case VT_I2: *number = v.iVal; return true;
     case VT_UI2: *number = v.uiVal; return true;
     case VT_I8: *number = static_cast<double>(v.llVal); return true;
@@ -42,10 +45,13 @@ bool SafeArrayReader::GetNumber(std::uint32_t k, double* number) const {
     if (k >= Count()) return false;
     const void* p = At(k);
     switch (m_array->vt) {
-    case VT_R8: case VT_DATE: *number = *static_cast<const double*>(p); return true;
+    case VT_R8:
+    case VT_DATE: *number = *static_cast<const double*>(p); return true;
     case VT_R4: *number = *static_cast<const float*>(p); return true;
-    case VT_I4: case VT_INT: *number = *static_cast<const std::int32_t*>(p); return true;
-    case VT_UI4: case VT_UINT: *number = *static_cast<const std::uint32_t*>(p); return true;
+    case VT_I4:
+    case VT_INT: *number = *static_cast<const std::int32_t*>(p); return true;
+    case VT_UI4:
+    case VT_UINT: *number = *static_cast<const std::uint32_t*>(p); return true;
     case VT_I8: *number = static_cast<double>(*static_cast<const std::int64_t*>(p)); return true;
     case VT_VARIANT: return NumberOfVariant(*static_cast<const VARIANT*>(p), number);
     default: return false;

@@ -12,7 +12,8 @@ void SplitVariableKey(const CString& key, const CString& defaultProject, CString
 
 class CMultipleOnlVarsPerPrj : public CCmdTarget {
 public:
-    CMultipleOnlVarsPerPrj(IOnlVariablesPerProjectNotification* pNotify, const CString& strDefaultProject, DWORD dwTimeout)
+    CMultipleOnlVarsPerPrj(IOnlVariablesPerProjectNotification* pNotify, const CString& strDefaultProject,
+                           DWORD dwTimeout)
         : m_pNotify(pNotify), m_strDefaultProject(strDefaultProject), m_dwTimeout(dwTimeout) {}
 
     // Subscribes the variable in its project. On true the holder cell belongs

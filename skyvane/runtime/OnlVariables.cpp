@@ -17,7 +17,8 @@ COnlVariables::~COnlVariables() {
 bool COnlVariables::AddVariable(IDispatch* pProject, const CString& strVariable, CVarItem** ppHolder) {
     if (!pProject) return false;
     CComPtr<IDispatch> variables = CallForObject(pProject, tarvo::dispid::ProjectVariables);
-    CComPtr<IDispatch> variable = CallForObject(variables.Get(), tarvo::dispid::CollectionItem, strVariable.GetString());
+    CComPtr<IDispatch> variable =
+        CallForObject(variables.Get(), tarvo::dispid::CollectionItem, strVariable.GetString());
     if (!variable) return false;
     LONG id = 0;
     // A variable whose id cannot be read could never be matched to its changes.
@@ -48,7 +49,8 @@ bool COnlVariables::Attach(IDispatch* pContainer) {
 void COnlVariables::Detach() {
     if (m_pContainer) {
         CallIgnoringResult(m_pContainer.Get(), tarvo::dispid::ContainerStop);
-        for (const CString& name : m_lstNames) CallIgnoringResult(m_pContainer.Get(), tarvo::dispid::ContainerRemove, name.GetString());
+        for (const CString& name : m_lstNames)
+            CallIgnoringResult(m_pContainer.Get(), tarvo::dispid::ContainerRemove, name.GetString());
         m_pContainer.Release();
     }
     m_xOnlVariableEv.Unadvise();

@@ -41,9 +41,9 @@ private:
     CVarItem** FindCell(DWORD id);
 
     XOnlVariableEv m_xOnlVariableEv;
-    CComPtr<IDispatch> m_pContainer;  // the runtime's container, null while detached
-    CStringList m_lstNames;           // names added, in order
-    CCriticalSection m_csIds;         // guards m_mapIds: read on the runtime's event thread
+    CComPtr<IDispatch> m_pContainer;              // the runtime's container, null while detached
+    CStringList m_lstNames;                       // names added, in order
+    CCriticalSection m_csIds;                     // guards m_mapIds: read on the runtime's event thread
     CMapOwner<DWORD, DWORD, CVarItem*> m_mapIds;  // runtime id -> holder cell (owns the cells only)
     IOnlVariablesNtf* m_pNotify;
 };

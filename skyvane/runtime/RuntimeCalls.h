@@ -14,7 +14,8 @@ CComPtr<IDispatch> CallForObject(IDispatch* object, DISPID member, const Args&..
     if (FAILED(CallMethod(object, member, &result, args...))) return nullptr;
     CComPtr<IDispatch> found;
     if (result.vt == VT_DISPATCH && result.pdispVal) found = result.pdispVal;
-    else if (result.vt == VT_UNKNOWN && result.punkVal) result.punkVal->QueryInterface(IID_IDispatch, found.ReceiveVoid());
+    else if (result.vt == VT_UNKNOWN && result.punkVal)
+        result.punkVal->QueryInterface(IID_IDispatch, found.ReceiveVoid());
     return found;
 }
 

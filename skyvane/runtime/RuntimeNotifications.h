@@ -28,8 +28,8 @@ public:
 class IOnlVariablesNtf {
 public:
     virtual ~IOnlVariablesNtf() = default;
-    virtual void OnVariableChange(double dId, const VARIANT* pValue, double dStatusLow, double dStatusHigh, double dTime,
-                                  CVarItem** ppHolder) = 0;
+    virtual void OnVariableChange(double dId, const VARIANT* pValue, double dStatusLow, double dStatusHigh,
+                                  double dTime, CVarItem** ppHolder) = 0;
 };
 
 // What the per-project objects report to the bridge.

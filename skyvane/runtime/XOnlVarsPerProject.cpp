@@ -28,14 +28,27 @@ void CopyByValue(VARIANT* dest, const VARIANT* src) {
     plain.vt = type;
     if (type & VT_ARRAY) plain.parray = *src->pparray;
     else switch (type) {
-        case VT_I1: case VT_UI1: plain.bVal = *src->pbVal; break;
-        case VT_I2: case VT_UI2: case VT_BOOL: plain.iVal = *src->piVal; break;
-        case VT_I4: case VT_UI4: case VT_INT: case VT_UINT: case VT_R4: case VT_ERROR: plain.lVal = *src->plVal; break;
-        case VT_I8: case VT_UI8: case VT_R8: case VT_CY: case VT_DATE: plain.llVal = *src->pllVal; break;
+        case VT_I1:
+        case VT_UI1: plain.bVal = *src->pbVal; break;
+        case VT_I2:
+        case VT_UI2:
+        case VT_BOOL: plain.iVal = *src->piVal; break;
+        case VT_I4:
+        case VT_UI4:
+        case VT_INT:
+        case VT_UINT:
+        case VT_R4:
+        case VT_ERROR: plain.lVal = *src->plVal; break;
+        case VT_I8:
+        case VT_UI8:
+        case VT_R8:
+        case VT_CY:
+        case VT_DATE: plain.llVal = *src->pllVal; break;
         case VT_BSTR: plain.bstrVal = *src->pbstrVal; break;
-        case VT_DISPATCH: case VT_UNKNOWN: plain.punkVal = *src->ppunkVal; break;
+        case VT_DISPATCH:
+        case VT_UNKNOWN: plain.punkVal = *src->ppunkVal; break;
         default: return;
-    }
+        }
     VariantCopy(dest, &plain);  // plain borrows; the copy owns
 }
 
@@ -84,7 +97,8 @@ void CXOnlVarsPerProject::ReleaseVariables() {
 }
 
 CString CXOnlVarsPerProject::GetContainerName() const {
-    return CString::Formatted(u"%p_%u_%u_GwOnl", static_cast<const void*>(this), GetCurrentThreadId(), GetCurrentProcessId());
+    return CString::Formatted(u"%p_%u_%u_GwOnl", static_cast<const void*>(this), GetCurrentThreadId(),
+                              GetCurrentProcessId());
 }
 
 void CXOnlVarsPerProject::RemoveContainer() {

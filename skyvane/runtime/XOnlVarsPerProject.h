@@ -61,7 +61,7 @@ private:
     VX_KeepRefCmdPtr<COnlProject> m_pWatcher;
     CString m_strProject;
     VX_KeepRefCmdPtr<COnlVariables> m_pVariables;
-    CMutex m_mutex;  // guards m_lstValues and every write of m_nCommand
+    CMutex m_mutex;                           // guards m_lstValues and every write of m_nCommand
     std::atomic<int> m_nCommand{kNoCommand};  // pending project command; read by the timer without the lock
     std::atomic<unsigned> m_nCommandsRun{0};  // commands carried out so far; a waiting poster watches it
     DWORD m_dwTimeout;

@@ -68,8 +68,7 @@ QWidget* MakeControl(QDialog& dialog, const DlgControl& control, QButtonGroup*& 
         combo->setInsertPolicy(QComboBox::NoInsert);
         return combo;
     }
-    case DlgControlKind::GroupBox:
-        return new QGroupBox(text, &dialog);
+    case DlgControlKind::GroupBox: return new QGroupBox(text, &dialog);
     case DlgControlKind::EtchedLine: {
         auto* line = new QFrame(&dialog);
         line->setFrameShape(QFrame::HLine);
@@ -110,7 +109,8 @@ void BuildDialog(QDialog& dialog, const DlgTemplate& dlg) {
         // A combo box's height includes its drop-down list; closed, it is as high as its field.
         if (control.kind == DlgControlKind::ComboBox) height = std::min(height, widget->sizeHint().height());
         if (control.kind == DlgControlKind::EtchedLine) height = std::max(height, 2);
-        widget->setGeometry(units.ToPixelsX(control.x), units.ToPixelsY(control.y), units.ToPixelsX(control.cx), height);
+        widget->setGeometry(units.ToPixelsX(control.x), units.ToPixelsY(control.y), units.ToPixelsX(control.cx),
+                            height);
         // Group boxes frame the controls listed before them: behind them, out of the tab order.
         if (control.kind == DlgControlKind::GroupBox) {
             widget->lower();

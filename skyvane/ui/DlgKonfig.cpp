@@ -153,13 +153,9 @@ CDlgKonfig::~CDlgKonfig() {
 
 LRESULT CDlgKonfig::CMessageWnd::WindowProc(UINT message, WPARAM wParam, LPARAM lParam) {
     switch (message) {
-    case WM_PROJECT_ACTIVE:
-        return m_owner.OnProjectActiveMessage();
-    case WM_PROJECT_INACTIVE:
-        m_owner.OnProjectInactiveMessage();
-        return 0;
-    default:
-        return CWnd::WindowProc(message, wParam, lParam);
+    case WM_PROJECT_ACTIVE: return m_owner.OnProjectActiveMessage();
+    case WM_PROJECT_INACTIVE: m_owner.OnProjectInactiveMessage(); return 0;
+    default: return CWnd::WindowProc(message, wParam, lParam);
     }
 }
 
@@ -272,7 +268,8 @@ void CDlgKonfig::FillVariableList(long position) {
     const CStringArray names = GetVariableNames(position, project.Get());
     CVarItem* exported = nullptr;
     for (const CString& name : names) {
-        if (!m_config.m_mapVariables.Lookup(projectName + u"#" + name, exported)) AppendListItem(*m_listVariables, name);
+        if (!m_config.m_mapVariables.Lookup(projectName + u"#" + name, exported))
+            AppendListItem(*m_listVariables, name);
     }
     SortList(*m_listVariables, m_headerVariables->IsDescending());
 }
@@ -388,7 +385,7 @@ LRESULT CDlgKonfig::OnProjectActiveMessage() {
 
 void CDlgKonfig::SetProjectControlsEnabled(bool enabled) {
     for (QWidget* control : std::initializer_list<QWidget*>{m_listProjects, m_listVariables, m_listExported,
-                                                             m_buttonAdd, m_buttonRemove, m_buttonOk})
+                                                            m_buttonAdd, m_buttonRemove, m_buttonOk})
         control->setEnabled(enabled);
 }
 

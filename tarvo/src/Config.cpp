@@ -124,7 +124,8 @@ private:
         if (value.isString()) {
             bool ok = false;
             const QString text = value.toString();
-            *out = text.startsWith("0x", Qt::CaseInsensitive) ? text.mid(2).toULongLong(&ok, 16) : text.toULongLong(&ok, 10);
+            *out = text.startsWith("0x", Qt::CaseInsensitive) ? text.mid(2).toULongLong(&ok, 16)
+                                                              : text.toULongLong(&ok, 10);
             if (ok) return true;
         } else if (value.isDouble()) {
             const double d = value.toDouble();
@@ -133,7 +134,8 @@ private:
                 return true;
             }
         }
-        return Fail(m_error, where + ": \"" + key + "\" must be a whole number, or a text such as \"0x8000000000000001\"");
+        return Fail(m_error,
+                    where + ": \"" + key + "\" must be a whole number, or a text such as \"0x8000000000000001\"");
     }
 
     bool ReadProject(const QJsonValue& value, const std::string& where, ProjectConfig* project) {
@@ -165,7 +167,8 @@ private:
         v.name = o.value("name").toString().toStdU16String();
         if (!Unsigned(o, "id", where, &v.id)) return false;
         const QString type = o.value("type").toString("number");
-        if (type != "number" && type != "text") return Fail(m_error, where + ": \"type\" must be \"number\" or \"text\"");
+        if (type != "number" && type != "text")
+            return Fail(m_error, where + ": \"type\" must be \"number\" or \"text\"");
         v.isText = type == "text";
         if (!(v.isText ? Text(o, "value", where, &v.text) : Number(o, "value", where, &v.number))) return false;
         if (!Status(o, "status", where, &v.status)) return false;
@@ -198,7 +201,8 @@ private:
         if (!o.contains("rate")) return true;
         if (!Number(o, "rate", where, rate)) return false;
         if (!(*rate > 0) || !std::isfinite(*rate)) return Fail(m_error, where + ": \"rate\" must be above 0");
-        if (g->kind == GeneratorKind::Constant) return Fail(m_error, where + ": \"rate\" needs a generator that changes");
+        if (g->kind == GeneratorKind::Constant)
+            return Fail(m_error, where + ": \"rate\" needs a generator that changes");
         if (o.value("generator").toObject().contains("period_ms"))
             return Fail(m_error, where + ": give \"rate\" or the generator's \"period_ms\", not both");
         g->periodMs = repeat * 1000.0 / *rate;
@@ -208,13 +212,17 @@ private:
     bool ReadGenerator(const QJsonValue& value, const std::string& where, GeneratorConfig* g) {
         if (!value.isObject()) return Fail(m_error, where + ": must be an object");
         const QJsonObject o = value.toObject();
-        if (!Keys(o, where, {"kind", "period_ms", "amplitude", "offset", "cycle_ms", "step", "min", "max", "texts",
-                             "alt_status", "seed", "stop_ms"}))
+        if (!Keys(o, where,
+                  {"kind", "period_ms", "amplitude", "offset", "cycle_ms", "step", "min", "max", "texts", "alt_status",
+                   "seed", "stop_ms"}))
             return false;
         static const std::pair<const char*, GeneratorKind> kinds[] = {
-            {"constant", GeneratorKind::Constant},       {"sine", GeneratorKind::Sine},
-            {"ramp", GeneratorKind::Ramp},               {"random_walk", GeneratorKind::RandomWalk},
-            {"counter", GeneratorKind::Counter},         {"text_cycle", GeneratorKind::TextCycle},
+            {"constant", GeneratorKind::Constant},
+            {"sine", GeneratorKind::Sine},
+            {"ramp", GeneratorKind::Ramp},
+            {"random_walk", GeneratorKind::RandomWalk},
+            {"counter", GeneratorKind::Counter},
+            {"text_cycle", GeneratorKind::TextCycle},
             {"status_flip", GeneratorKind::StatusFlip},
         };
         const QString kind = o.value("kind").toString();
@@ -227,10 +235,10 @@ private:
         }
         if (!known) return Fail(m_error, where + ": unknown \"kind\" \"" + kind.toStdString() + "\"");
         if (!Unsigned(o, "period_ms", where, &g->periodMs) || !Unsigned(o, "cycle_ms", where, &g->cycleMs) ||
-            !Unsigned(o, "seed", where, &g->seed) || !Unsigned(o, "stop_ms", where, &g->stopMs) || !Number(o, "amplitude", where, &g->amplitude) ||
-            !Number(o, "offset", where, &g->offset) || !Number(o, "step", where, &g->step) ||
-            !Number(o, "min", where, &g->minimum) || !Number(o, "max", where, &g->maximum) ||
-            !Status(o, "alt_status", where, &g->alternateStatus))
+            !Unsigned(o, "seed", where, &g->seed) || !Unsigned(o, "stop_ms", where, &g->stopMs) ||
+            !Number(o, "amplitude", where, &g->amplitude) || !Number(o, "offset", where, &g->offset) ||
+            !Number(o, "step", where, &g->step) || !Number(o, "min", where, &g->minimum) ||
+            !Number(o, "max", where, &g->maximum) || !Status(o, "alt_status", where, &g->alternateStatus))
             return false;
         if (o.contains("texts")) {
             if (!o.value("texts").isArray()) return Fail(m_error, where + ": \"texts\" must be an array of texts");

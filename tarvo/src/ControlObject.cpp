@@ -23,7 +23,8 @@ void ReturnLong(VARIANT* result, long value) {
 HRESULT ReturnArray(VARIANT* result, const std::vector<CComVariant>& items) {
     SAFEARRAY* array = SafeArrayCreateVector(VT_VARIANT, 0, static_cast<std::uint32_t>(items.size()));
     if (!array) return E_OUTOFMEMORY;
-    for (LONG i = 0; i < static_cast<LONG>(items.size()); ++i) SafeArrayPutElement(array, &i, &items[static_cast<size_t>(i)]);
+    for (LONG i = 0; i < static_cast<LONG>(items.size()); ++i)
+        SafeArrayPutElement(array, &i, &items[static_cast<size_t>(i)]);
     result->vt = VT_ARRAY | VT_VARIANT;
     result->parray = array;
     return S_OK;

@@ -194,7 +194,8 @@ bool Engine::SetProjectActive(const std::u16string& projectName, bool active, st
     if (active) {
         for (auto& [name, container] : project->containers) container->sendAll = true;
     }
-    events->push_back(Event{project->events, active ? dispid::EventProjectActive : dispid::EventProjectInactive, {}, true});
+    events->push_back(
+        Event{project->events, active ? dispid::EventProjectActive : dispid::EventProjectInactive, {}, true});
     return true;
 }
 

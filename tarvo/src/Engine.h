@@ -113,7 +113,7 @@ public:
     // containers, the fault switches and the simulated clock. Never held while
     // a sink is called or while a connection point's own lock is taken.
     mutable std::mutex m_lock;
-    Faults m_faults;             // guarded by m_lock
+    Faults m_faults;              // guarded by m_lock
     ULONGLONG m_simulatedMs = 0;  // guarded by m_lock
     // Changes fired by the simulation (one per variable per event), read without the lock.
     std::atomic<ULONGLONG> m_changesFired{0};

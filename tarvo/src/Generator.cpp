@@ -36,11 +36,10 @@ bool AdvanceGenerator(VariableState& v, ULONGLONG nowMs) {
     // One change per due tick; a period shorter than the tick changes once per tick.
     while (v.nextChangeMs <= static_cast<double>(nowMs)) v.nextChangeMs += g.periodMs;
     switch (g.kind) {
-    case GeneratorKind::Constant:
-        return false;
+    case GeneratorKind::Constant: return false;
     case GeneratorKind::Sine:
         SetNumber(v, g.offset + g.amplitude * std::sin(2 * std::numbers::pi * static_cast<double>(nowMs % g.cycleMs) /
-                                                        static_cast<double>(g.cycleMs)));
+                                                       static_cast<double>(g.cycleMs)));
         break;
     case GeneratorKind::Ramp: {
         const double next = v.number + g.step;
@@ -52,9 +51,7 @@ bool AdvanceGenerator(VariableState& v, ULONGLONG nowMs) {
         SetNumber(v, std::clamp(v.number + delta(v.random), g.minimum, g.maximum));
         break;
     }
-    case GeneratorKind::Counter:
-        SetNumber(v, v.number + g.step);
-        break;
+    case GeneratorKind::Counter: SetNumber(v, v.number + g.step); break;
     case GeneratorKind::TextCycle:
         v.value = CComVariant(std::u16string_view(g.texts[v.textIndex % g.texts.size()]));
         v.textIndex = (v.textIndex + 1) % g.texts.size();

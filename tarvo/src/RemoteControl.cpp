@@ -11,7 +11,8 @@ CComVariant VariantList(const std::vector<CComVariant>& items) {
     CComVariant list;
     SAFEARRAY* array = SafeArrayCreateVector(VT_VARIANT, 0, static_cast<std::uint32_t>(items.size()));
     if (!array) return list;
-    for (LONG i = 0; i < static_cast<LONG>(items.size()); ++i) SafeArrayPutElement(array, &i, &items[static_cast<size_t>(i)]);
+    for (LONG i = 0; i < static_cast<LONG>(items.size()); ++i)
+        SafeArrayPutElement(array, &i, &items[static_cast<size_t>(i)]);
     list.vt = VT_ARRAY | VT_VARIANT;
     list.parray = array;
     return list;
@@ -31,7 +32,8 @@ int High(ULONGLONG status) { return static_cast<int>(static_cast<std::uint32_t>(
 CComPtr<IDispatch> RemoteControl::Find() {
     CComPtr<IUnknown> unknown;
     CComPtr<IDispatch> control;
-    if (SUCCEEDED(GetActiveObject(CLSID_TarvoControl, unknown.Receive()))) unknown.QueryInterface(IID_IDispatch, control);
+    if (SUCCEEDED(GetActiveObject(CLSID_TarvoControl, unknown.Receive())))
+        unknown.QueryInterface(IID_IDispatch, control);
     return control;
 }
 
@@ -107,7 +109,9 @@ std::vector<ContainerInfo> RemoteControl::Containers(const std::u16string& proje
         const VARIANT* fields = Elements(items[i]);
         const std::uint32_t count = fields ? items[i].parray->cElements : 0;
         if (count < 3) continue;
-        ContainerInfo info{TextOf(fields[0]), {}, fields[1].vt == VT_BOOL && fields[1].boolVal != VARIANT_FALSE,
+        ContainerInfo info{TextOf(fields[0]),
+                           {},
+                           fields[1].vt == VT_BOOL && fields[1].boolVal != VARIANT_FALSE,
                            fields[2].vt == VT_I4 ? static_cast<size_t>(fields[2].lVal) : 0};
         for (std::uint32_t k = 3; k < count; ++k) info.variables.push_back(TextOf(fields[k]));
         list.push_back(std::move(info));

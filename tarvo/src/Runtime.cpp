@@ -24,7 +24,7 @@ struct Runtime::Impl {
     std::condition_variable wake;       // new events, a change of pause, or the end
     std::condition_variable delivered;  // m_delivered moved on
     std::deque<std::vector<Event>> queue;
-    ULONGLONG queued = 0;     // event batches handed to the thread so far
+    ULONGLONG queued = 0;          // event batches handed to the thread so far
     ULONGLONG deliveredCount = 0;  // of those, delivered (or dropped at the end)
     bool paused = false;
     bool threadRunning = false;
@@ -95,7 +95,8 @@ void Runtime::Impl::Dispatch(std::vector<Event> events) {
     for (Event& event : events) event.Deliver();
 }
 
-Runtime::Runtime(RuntimeConfig config, RuntimeOptions options) : m(std::make_unique<Impl>(std::move(config), options)) {}
+Runtime::Runtime(RuntimeConfig config, RuntimeOptions options)
+    : m(std::make_unique<Impl>(std::move(config), options)) {}
 
 Runtime::~Runtime() { Stop(); }
 

@@ -126,7 +126,8 @@ int Containers(tarvo::RemoteControl& control, const std::string& project) {
     const auto list = control.Containers(U16(project));
     if (FAILED(control.LastStatus())) return Fail("the runtime did not answer");
     for (const auto& info : list) {
-        std::printf("%s %s, %zu sinks:", Utf16ToUtf8(info.name).c_str(), info.started ? "started" : "stopped", info.sinks);
+        std::printf("%s %s, %zu sinks:", Utf16ToUtf8(info.name).c_str(), info.started ? "started" : "stopped",
+                    info.sinks);
         for (const auto& name : info.variables) std::printf(" %s", Utf16ToUtf8(name).c_str());
         std::printf("\n");
     }
@@ -134,8 +135,8 @@ int Containers(tarvo::RemoteControl& control, const std::string& project) {
 }
 
 int Fault(tarvo::RemoteControl& control, const Args& args) {
-    static const char* const kObjects[] = {"application", "projects", "project", "variables",
-                                           "variable", "containers", "container"};
+    static const char* const kObjects[] = {"application", "projects",   "project",  "variables",
+                                           "variable",    "containers", "container"};
     bool on = false;
     bool ok = false;
     if (args.size() == 2 && args[1] == "clear") {
@@ -165,7 +166,8 @@ CComVariant NumberArray(const std::vector<double>& numbers) {
     CComVariant array;
     array.vt = VT_ARRAY | VT_R8;
     array.parray = SafeArrayCreateVector(VT_R8, 0, static_cast<std::uint32_t>(numbers.size()));
-    if (array.parray && !numbers.empty()) std::memcpy(array.parray->pvData, numbers.data(), numbers.size() * sizeof(double));
+    if (array.parray && !numbers.empty())
+        std::memcpy(array.parray->pvData, numbers.data(), numbers.size() * sizeof(double));
     return array;
 }
 
@@ -180,7 +182,8 @@ int Bulk(tarvo::RemoteControl& control, const Args& args) {
         if (at == std::string::npos || !ParseNumber(args[i].substr(0, at), &id)) return Usage();
         const std::string text = args[i].substr(at + 1);
         double number = 0;
-        const CComVariant value = ParseNumber(text, &number) ? CComVariant(number) : CComVariant(std::u16string_view(U16(text)));
+        const CComVariant value = ParseNumber(text, &number) ? CComVariant(number)
+                                                             : CComVariant(std::u16string_view(U16(text)));
         const LONG index = static_cast<LONG>(ids.size());
         SafeArrayPutElement(values.parray, &index, &value);
         ids.push_back(id);
@@ -188,29 +191,34 @@ int Bulk(tarvo::RemoteControl& control, const Args& args) {
         times.push_back(Now());
     }
     const bool fired = control.FireRawBulkChange(U16(args[1]), U16(args[2]),
-        {CComVariant(static_cast<int>(ids.size())), NumberArray(ids), values, NumberArray(zeros), NumberArray(zeros),
-         NumberArray(times)});
+                                                 {CComVariant(static_cast<int>(ids.size())), NumberArray(ids), values,
+                                                  NumberArray(zeros), NumberArray(zeros), NumberArray(times)});
     return fired ? 0 : Fail("no such project or container, or the runtime did not answer");
 }
 
 int Run(const Args& args) {
     const std::string& command = args[0];
-    if ((command == "projects" && args.size() == 1) || (command == "variables" && args.size() == 2)) return Browse(args);
+    if ((command == "projects" && args.size() == 1) || (command == "variables" && args.size() == 2))
+        return Browse(args);
     tarvo::RemoteControl control(tarvo::RemoteControl::Find());
     if (command == "containers" && args.size() == 2) return Containers(control, args[1]);
     if ((command == "set" || command == "set-text") && args.size() == 4) {
         double number = 0;
         const bool isNumber = command == "set" && ParseNumber(args[3], &number);
         const CComVariant value = isNumber ? CComVariant(number) : CComVariant(std::u16string_view(U16(args[3])));
-        return control.SetValue(U16(args[1]), U16(args[2]), value) ? 0 : Fail("no such project or variable, or no runtime");
+        return control.SetValue(U16(args[1]), U16(args[2]), value) ? 0
+                                                                   : Fail("no such project or variable, or no runtime");
     }
     if (command == "status" && args.size() == 4) {
         ULONGLONG status = 0;
         if (!ParseStatus(args[3], &status)) return Usage();
-        return control.SetStatus(U16(args[1]), U16(args[2]), status) ? 0 : Fail("no such project or variable, or no runtime");
+        return control.SetStatus(U16(args[1]), U16(args[2]), status)
+                   ? 0
+                   : Fail("no such project or variable, or no runtime");
     }
     if ((command == "activate" || command == "deactivate") && args.size() == 2)
-        return control.SetProjectActive(U16(args[1]), command == "activate") ? 0 : Fail("no such project, or no runtime");
+        return control.SetProjectActive(U16(args[1]), command == "activate") ? 0
+                                                                             : Fail("no such project, or no runtime");
     if (command == "fault" && args.size() >= 2) return Fault(control, args);
     if (command == "bulk" && args.size() >= 4) return Bulk(control, args);
     return Usage();

@@ -175,7 +175,8 @@ int main(int argc, char** argv) {
     socket.log = LogLine;
     CComPtr<IDispatch> control = runtime.ControlObject();
     DWORD applicationServer = 0, controlServer = 0;
-    if (FAILED(RegisterLocalServer(runtime.Application().Get(), CLSID_TarvoApplication, socket, &applicationServer, &error)) ||
+    if (FAILED(RegisterLocalServer(runtime.Application().Get(), CLSID_TarvoApplication, socket, &applicationServer,
+                                   &error)) ||
         FAILED(RegisterLocalServer(control.Get(), CLSID_TarvoControl, socket, &controlServer, &error))) {
         LogLine(error);
         if (applicationServer) RevokeLocalServer(applicationServer);

@@ -81,8 +81,7 @@ public:
             }
             return S_OK;
         }
-        default:
-            return DISP_E_MEMBERNOTFOUND;
+        default: return DISP_E_MEMBERNOTFOUND;
         }
     }
     HRESULT FindConnectionPoint(REFIID events, IConnectionPoint** point) override {
@@ -128,7 +127,9 @@ protected:
     }
     void Register() {
         std::string error;
-        ASSERT_EQ(RegisterLocalServer(static_cast<IDispatch*>(echo.Get()), CLSID_Echo, options, &registration, &error), S_OK) << error;
+        ASSERT_EQ(RegisterLocalServer(static_cast<IDispatch*>(echo.Get()), CLSID_Echo, options, &registration, &error),
+                  S_OK)
+            << error;
     }
     CComPtr<IDispatch> Find() {
         CComPtr<IUnknown> unknown;
@@ -141,9 +142,7 @@ protected:
         EXPECT_EQ(CallMethod(object, 1, &result, value), S_OK);
         return result;
     }
-    std::string SocketPath() const {
-        return options.folder + "/11112222-3333-4444-0505-060607070808.sock";
-    }
+    std::string SocketPath() const { return options.folder + "/11112222-3333-4444-0505-060607070808.sock"; }
 
     TempFolder folder;
     LocalSocketOptions options;
@@ -205,10 +204,12 @@ private:
 };
 
 // A call frame's payload: Invoke of member 1 on an object, with raw argument bytes.
-std::vector<std::uint8_t> InvokeFrame(std::uint64_t object, std::uint32_t count, const std::vector<std::uint8_t>& args) {
+std::vector<std::uint8_t> InvokeFrame(std::uint64_t object, std::uint32_t count,
+                                      const std::vector<std::uint8_t>& args) {
     std::vector<std::uint8_t> frame{2, 7, 0, 0, 0, 3};
     auto put = [&](const void* data, size_t size) {
-        frame.insert(frame.end(), static_cast<const std::uint8_t*>(data), static_cast<const std::uint8_t*>(data) + size);
+        frame.insert(frame.end(), static_cast<const std::uint8_t*>(data),
+                     static_cast<const std::uint8_t*>(data) + size);
     };
     const std::int32_t member = 1;
     const std::uint16_t flags = DISPATCH_METHOD;
@@ -326,7 +327,8 @@ TEST_F(LocalSocket, EventsReachTheSinkOnATransportThreadBeforeTheFiringCallRetur
     CComPtr<IConnectionPoint> point;
     ASSERT_EQ(object.QueryInterface(IID_IConnectionPointContainer, points), S_OK);
     ASSERT_EQ(points->FindConnectionPoint(DIID_IEchoEvents, point.Receive()), S_OK);
-    EXPECT_EQ(points->FindConnectionPoint(IID_IDispatch, CComPtr<IConnectionPoint>().Receive()), CONNECT_E_NOCONNECTION);
+    EXPECT_EQ(points->FindConnectionPoint(IID_IDispatch, CComPtr<IConnectionPoint>().Receive()),
+              CONNECT_E_NOCONNECTION);
     auto sink = MakeComObject<RecordingSink>(DIID_IEchoEvents);
     DWORD cookie = 0;
     ASSERT_EQ(point->Advise(sink.Get(), &cookie), S_OK);
@@ -389,14 +391,14 @@ TEST_F(LocalSocket, MalformedOrTruncatedFramesCloseOnlyThatConnection) {
     ASSERT_TRUE(object);
     const std::uint32_t tooLarge = 0x7FFFFFFF;
     const std::vector<std::vector<std::uint8_t>> garbage = {
-        {9, 9, 9},                                    // unknown kind
-        {2, 1, 0, 0, 0, 3, 1, 0, 0, 0, 0, 0, 0, 0},   // a call cut short inside its fields
-        {4, 99, 0, 0, 0, 0, 0, 0, 0},                 // release of an object never exported
-        {3, 1, 0},                                    // a reply too short for its status
+        {9, 9, 9},                                                               // unknown kind
+        {2, 1, 0, 0, 0, 3, 1, 0, 0, 0, 0, 0, 0, 0},                              // a call cut short inside its fields
+        {4, 99, 0, 0, 0, 0, 0, 0, 0},                                            // release of an object never exported
+        {3, 1, 0},                                                               // a reply too short for its status
         InvokeFrame(1, 1, {0x05, 0x20, 1, 0, 0, 0, 0, 0xFF, 0xFF, 0xFF, 0x7F}),  // an array larger than the frame
-        InvokeFrame(1, 1, {0x08, 0, 0xFE, 0xFF, 0xFF, 0x7F}),                   // a text larger than the frame
-        InvokeFrame(1, 1, {0xFF, 0x0F}),                                        // a type that does not exist
-        InvokeFrame(1, 65, {}),                                                 // more arguments than allowed
+        InvokeFrame(1, 1, {0x08, 0, 0xFE, 0xFF, 0xFF, 0x7F}),                    // a text larger than the frame
+        InvokeFrame(1, 1, {0xFF, 0x0F}),                                         // a type that does not exist
+        InvokeFrame(1, 65, {}),                                                  // more arguments than allowed
         InvokeFrame(1, 1, {0x03, 0x40, 0x08, 0, 0, 0, 0, 0}),  // a reference to I4 whose target is a text
         InvokeFrame(1, 1, {0x0C, 0x40, 0x0C, 0x40, 0, 0}),     // a reference inside a reference
         InvokeFrame(1, 0, {0}),                                // bytes after the last field

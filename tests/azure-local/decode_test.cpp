@@ -25,9 +25,10 @@ std::string Bytes(std::initializer_list<int> bytes) {
 }  // namespace
 
 TEST(JsonReader, AcceptsRowsAndKeepsLargeIntegers) {
-    const auto result = DecodeJsonRows(" [" + kRow + "," +
-                                       R"({"project":"","variable":"T","value":"x\u00e9\ud83d\ude00","time":"1970-01-01T00:00:00.000Z","status":0},)"
-                                       R"({"project":"","variable":"N","value":null,"time":"1970-01-01T00:00:00.000Z","status":0}])");
+    const auto result = DecodeJsonRows(
+        " [" + kRow + "," +
+        R"({"project":"","variable":"T","value":"x\u00e9\ud83d\ude00","time":"1970-01-01T00:00:00.000Z","status":0},)"
+        R"({"project":"","variable":"N","value":null,"time":"1970-01-01T00:00:00.000Z","status":0}])");
     ASSERT_TRUE(result.ok) << result.error;
     ASSERT_EQ(result.rows.size(), 3u);
     EXPECT_EQ(result.rows[0].status, 18446744073709551615ull);
@@ -43,7 +44,7 @@ TEST(JsonReader, RejectsMalformedBodies) {
         "{}",
         "[" + kRow + ",]",
         "[" + kRow + "] x",
-        R"([{"project":"P","variable":"V","value":1,"time":"2024-01-01T00:00:00.000Z"}])",                 // no status
+        R"([{"project":"P","variable":"V","value":1,"time":"2024-01-01T00:00:00.000Z"}])",  // no status
         R"([{"project":"P","variable":"V","value":1,"time":"2024-01-01T00:00:00.000Z","status":0,"x":1}])",  // extra
         R"([{"project":"P","variable":"V","value":1,"time":"2024-01-01 00:00:00","status":0}])",
         R"([{"project":"P","variable":"V","value":1,"time":"2024-13-01T00:00:00.000Z","status":0}])",
@@ -54,7 +55,8 @@ TEST(JsonReader, RejectsMalformedBodies) {
         R"([{"project":"\ud800","variable":"V","value":1,"time":"2024-01-01T00:00:00.000Z","status":0}])",
         "[{\"project\":\"\xff\",\"variable\":\"V\",\"value\":1,\"time\":\"2024-01-01T00:00:00.000Z\",\"status\":0}]",
         "[{\"project\":\"a\tb\",\"variable\":\"V\",\"value\":1,\"time\":\"2024-01-01T00:00:00.000Z\",\"status\":0}]",
-        "[{\"project\":\"\xed\xa0\x80\",\"variable\":\"V\",\"value\":1,\"time\":\"2024-01-01T00:00:00.000Z\",\"status\":0}]",
+        "[{\"project\":\"\xed\xa0\x80\",\"variable\":\"V\",\"value\":1,\"time\":\"2024-01-01T00:00:00.000Z\","
+        "\"status\":0}]",
         std::string(100, '[') + std::string(100, ']'),
     };
     for (const auto& body : bad) {
@@ -67,7 +69,8 @@ TEST(JsonReader, RejectsMalformedBodies) {
 TEST(XmlReader, AcceptsRowsAndRejectsMalformedBodies) {
     const auto good = DecodeXmlRows(
         "<?xml version=\"1.0\" encoding=\"UTF-8\"?><rows>"
-        "<row project=\"a&amp;b\" variable=\"v&#10;\" time=\"2024-01-01T00:00:00.001Z\" status=\"5\" type=\"text\">x &lt; y</row>"
+        "<row project=\"a&amp;b\" variable=\"v&#10;\" time=\"2024-01-01T00:00:00.001Z\" status=\"5\" type=\"text\">x "
+        "&lt; y</row>"
         "<row project=\"\" variable=\"n\" time=\"2024-01-01T00:00:00.000Z\" status=\"0\" type=\"number\">-INF</row>"
         "</rows>");
     ASSERT_TRUE(good.ok) << good.error;
@@ -77,19 +80,24 @@ TEST(XmlReader, AcceptsRowsAndRejectsMalformedBodies) {
     EXPECT_EQ(good.rows[0].text, "x < y");
     EXPECT_TRUE(std::isinf(good.rows[1].value));
 
-    const std::string row = "<row project=\"p\" variable=\"v\" time=\"2024-01-01T00:00:00.000Z\" status=\"1\" type=\"number\">";
+    const std::string row =
+        "<row project=\"p\" variable=\"v\" time=\"2024-01-01T00:00:00.000Z\" status=\"1\" type=\"number\">";
     const std::string bad[] = {
         "",
         "<rowz></rowz>",
-        "<rows>" + row + "1</row>",                 // not closed
-        "<rows>" + row + "abc</row></rows>",        // not a number
-        "<rows>" + row + "1</row></rows><rows/>",   // a second root
+        "<rows>" + row + "1</row>",                // not closed
+        "<rows>" + row + "abc</row></rows>",       // not a number
+        "<rows>" + row + "1</row></rows><rows/>",  // a second root
         "<rows><row project=\"p\" variable=\"v\" time=\"x\" status=\"1\" type=\"number\">1</row></rows>",
-        "<rows><row project=\"p\" variable=\"v\" time=\"2024-01-01T00:00:00.000Z\" status=\"-1\" type=\"number\">1</row></rows>",
-        "<rows><row project=\"p\" variable=\"v\" time=\"2024-01-01T00:00:00.000Z\" status=\"1\" type=\"bool\">1</row></rows>",
+        "<rows><row project=\"p\" variable=\"v\" time=\"2024-01-01T00:00:00.000Z\" status=\"-1\" "
+        "type=\"number\">1</row></rows>",
+        "<rows><row project=\"p\" variable=\"v\" time=\"2024-01-01T00:00:00.000Z\" status=\"1\" "
+        "type=\"bool\">1</row></rows>",
         "<rows><row variable=\"v\" time=\"2024-01-01T00:00:00.000Z\" status=\"1\" type=\"text\">1</row></rows>",
-        "<rows><row project=\"p&\" variable=\"v\" time=\"2024-01-01T00:00:00.000Z\" status=\"1\" type=\"text\">1</row></rows>",
-        "<rows><row project=\"p\" variable=\"v\" time=\"2024-01-01T00:00:00.000Z\" status=\"1\" type=\"text\">\x01</row></rows>",
+        "<rows><row project=\"p&\" variable=\"v\" time=\"2024-01-01T00:00:00.000Z\" status=\"1\" "
+        "type=\"text\">1</row></rows>",
+        "<rows><row project=\"p\" variable=\"v\" time=\"2024-01-01T00:00:00.000Z\" status=\"1\" "
+        "type=\"text\">\x01</row></rows>",
         "<rows><other/></rows>",
     };
     for (const auto& body : bad) {
@@ -101,11 +109,11 @@ TEST(XmlReader, AcceptsRowsAndRejectsMalformedBodies) {
 TEST(BondReader, SkipsUnknownFieldsAndFillsDefaults) {
     // Rows { 0: list<Row> } with one Row holding only variable "v" plus an
     // unknown field 9 (a nested list of int32) that a reader must skip.
-    const std::string body = Bytes({0x43, 0x42, 0x01, 0x00, 0x0B, 0x0A, 0x01,  //
-                                    0x29, 0x01, 'v',                           // 1: variable
-                                    0xCB, 0x09, 0x10, 0x02, 0x02, 0x04,        // 9: list<int32> {1, 2}
-                                    0x00,                                      // end of Row
-                                    0xCD, 0x20, 0x09, 0x09, 0x01, 0x01, 'k', 0x01, 'v',  // 32: map<string,string>
+    const std::string body = Bytes({0x43, 0x42, 0x01, 0x00, 0x0B, 0x0A, 0x01,             //
+                                    0x29, 0x01, 'v',                                      // 1: variable
+                                    0xCB, 0x09, 0x10, 0x02, 0x02, 0x04,                   // 9: list<int32> {1, 2}
+                                    0x00,                                                 // end of Row
+                                    0xCD, 0x20, 0x09, 0x09, 0x01, 0x01, 'k',  0x01, 'v',  // 32: map<string,string>
                                     0x00});
     const auto result = DecodeBondRows(body);
     ASSERT_TRUE(result.ok) << result.error;
@@ -120,16 +128,16 @@ TEST(BondReader, SkipsUnknownFieldsAndFillsDefaults) {
 TEST(BondReader, RejectsMalformedBodies) {
     const std::string bad[] = {
         "",
-        Bytes({0x43, 0x42, 0x02, 0x00, 0x00}),                               // version 2
-        Bytes({0x43, 0x42, 0x01, 0x00}),                                     // no STOP
-        Bytes({0x43, 0x42, 0x01, 0x00, 0x0B, 0x0A, 0x05, 0x00, 0x00}),       // 5 rows promised, 1 given
+        Bytes({0x43, 0x42, 0x02, 0x00, 0x00}),                                           // version 2
+        Bytes({0x43, 0x42, 0x01, 0x00}),                                                 // no STOP
+        Bytes({0x43, 0x42, 0x01, 0x00, 0x0B, 0x0A, 0x05, 0x00, 0x00}),                   // 5 rows promised, 1 given
         Bytes({0x43, 0x42, 0x01, 0x00, 0x0B, 0x0A, 0x01, 0x29, 0x09, 'v', 0x00, 0x00}),  // string runs past the end
         Bytes({0x43, 0x42, 0x01, 0x00, 0x0B, 0x0A, 0x01, 0x28, 0x00, 0x00}),  // variable as double: wrong type
         Bytes({0x43, 0x42, 0x01, 0x00, 0x0B, 0x09, 0x01, 0x01, 'v', 0x00}),   // list of strings
         Bytes({0x43, 0x42, 0x01, 0x00, 0x00, 0x00}),                          // bytes after the end
         Bytes({0x43, 0x42, 0x01, 0x00, 0x0B, 0x0A, 0x01, 0x29, 0x01, 0xFF, 0x00, 0x00}),  // invalid UTF-8
         Bytes({0x43, 0x42, 0x01, 0x00, 0x0B, 0x0A, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 0xFF, 0x01}),
-        Bytes({0x43, 0x42, 0x01, 0x00, 0x1F, 0x00}),                          // unknown type 31
+        Bytes({0x43, 0x42, 0x01, 0x00, 0x1F, 0x00}),  // unknown type 31
     };
     for (const auto& body : bad) EXPECT_FALSE(DecodeBondRows(body).ok) << body.size();
 }
@@ -187,8 +195,9 @@ TEST(IsoTimes, OnlyTheExactFormIsRead) {
                              "2023-02-29T00:00:00.000Z", "2024-04-31T00:00:00.000Z"}) {
         EXPECT_FALSE(ParseIsoTime(text, seconds, ms)) << text;
     }
-    const auto xml = DecodeXmlRows("<rows><row project=\"p\" variable=\"v\" time=\"19993-2-11T23:59:59.999Z\" status=\"1\" "
-                                   "type=\"number\">1</row></rows>");
+    const auto xml = DecodeXmlRows(
+        "<rows><row project=\"p\" variable=\"v\" time=\"19993-2-11T23:59:59.999Z\" status=\"1\" "
+        "type=\"number\">1</row></rows>");
     EXPECT_FALSE(xml.ok);
     EXPECT_EQ(xml.error, "XML body: malformed time");
 }

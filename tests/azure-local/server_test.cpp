@@ -201,7 +201,8 @@ std::string JsonRowBody(qint64 ageMs) {
 
 TEST_F(ServerTest, ReportsHowOldDecodedRowsAreOnArrival) {
     EXPECT_EQ(server->Stats().latencyP50Ms, -1) << "nothing decoded yet";
-    for (int i = 0; i < 9; ++i) ASSERT_EQ(client.Post(base + "/q/messages", Headers("q"), JsonRowBody(2000)).status, 201);
+    for (int i = 0; i < 9; ++i)
+        ASSERT_EQ(client.Post(base + "/q/messages", Headers("q"), JsonRowBody(2000)).status, 201);
     ASSERT_EQ(client.Post(base + "/q/messages", Headers("q"), JsonRowBody(30000)).status, 201);
     const auto stats = server->Stats();
     EXPECT_EQ(stats.latencyRows, 10u);
@@ -267,8 +268,9 @@ TEST(ServerCountOnly, WaitAnswersWhenTheRowsHaveArrivedOrAtItsTimeOut) {
     const std::string json = R"([{"project":"P","variable":"A","value":1,"time":"x","status":0},)"
                              R"({"project":"P","variable":"B","value":2,"time":"x","status":0}])";
     // The message may come before the wait is registered; either way the answer has both rows.
-    EXPECT_EQ(client.Post("http://127.0.0.1:" + std::to_string(server->Port()) + "/q/messages",
-                          {"Authorization: " + Token(server->Port(), "q"), "Format: \"JSON\""}, json)
+    EXPECT_EQ(client
+                  .Post("http://127.0.0.1:" + std::to_string(server->Port()) + "/q/messages",
+                        {"Authorization: " + Token(server->Port(), "q"), "Format: \"JSON\""}, json)
                   .status,
               201);
     const auto arrived = waiting.get();

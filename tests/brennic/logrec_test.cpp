@@ -25,7 +25,8 @@ TEST(LogRecTest, CreatedOnlyForAnEnabledLevelOfASink) {
     sink.SetLevelMask(19, LOG_LEVEL_ERROR);
     EXPECT_EQ(CLogRec::CreateLogRec(&sink, 19, LOG_LEVEL_INFO, LOGREC_KIND_MODULE_TEXT, nullptr), nullptr);
 
-    std::unique_ptr<CLogRec> record(CLogRec::CreateLogRec(&sink, 19 + 64, LOG_LEVEL_ERROR, LOGREC_KIND_MODULE_TEXT, nullptr));
+    std::unique_ptr<CLogRec> record(
+        CLogRec::CreateLogRec(&sink, 19 + 64, LOG_LEVEL_ERROR, LOGREC_KIND_MODULE_TEXT, nullptr));
     ASSERT_NE(record, nullptr);
     EXPECT_EQ(record->GetModuleIndex(), 19);  // index taken modulo 64
     EXPECT_EQ(record->GetKind(), LOGREC_KIND_MODULE_TEXT);
@@ -86,6 +87,7 @@ TEST_F(LogLineTest, OneLinePerRecordWithTimeModuleLevelKindFieldAndText) {
     ASSERT_EQ(lines.size(), 3u);
     for (const std::string& line : lines) EXPECT_TRUE(StartsWithTime(line)) << line;
     EXPECT_EQ(lines[0].substr(24), R"(Runtime ERROR kind=76 field=39: first line\r\nsecond\tline \ end)");
-    EXPECT_EQ(lines[1].substr(24), "Runtime INFO kind=76 field=49: lone \xEF\xBF\xBD nul \\x00 \xC3\xA4\xF0\x9F\x98\x80");
+    EXPECT_EQ(lines[1].substr(24),
+              "Runtime INFO kind=76 field=49: lone \xEF\xBF\xBD nul \\x00 \xC3\xA4\xF0\x9F\x98\x80");
     EXPECT_EQ(lines[2].substr(24), "module40 LEVEL(0x81) kind=0 field=5: (confidential) | field=6: visible");
 }

@@ -36,8 +36,9 @@ TEST_F(LogSinkTest, ConfigurationSetsLevelsDestinationsAndReportsBadLines) {
     EXPECT_EQ(sink.GetLevelMask(19), LOG_LEVEL_ERROR | LOG_LEVEL_INFO);
     EXPECT_EQ(sink.GetLevelMask(5), 0);
 
-    UseConfig(sink, "; comment\n[levels]\ndefault = 2\n19 = 0x80\n63=1\n64 = 1\n7 = 300\n"
-                    "[file]\npath = /some/where.log\nkeep = lots\nbogus = 1\n[queue]\ncapacity = 0\nno equals sign\n");
+    UseConfig(sink,
+              "; comment\n[levels]\ndefault = 2\n19 = 0x80\n63=1\n64 = 1\n7 = 300\n"
+              "[file]\npath = /some/where.log\nkeep = lots\nbogus = 1\n[queue]\ncapacity = 0\nno equals sign\n");
     testing::internal::CaptureStderr();
     EXPECT_TRUE(sink.ReadCfg());
     const std::string reported = testing::internal::GetCapturedStderr();
@@ -103,7 +104,8 @@ TEST_F(LogSinkTest, FullQueueDropsTheOldestAndLogsHowMany) {
     const auto lines = LogLines();
     ASSERT_EQ(lines.size(), 6u);
     EXPECT_NE(lines[0].find("Log WARNING kind=1 field=1: 7 log records were dropped: the log queue was full"),
-              std::string::npos) << lines[0];
+              std::string::npos)
+        << lines[0];
     for (int i = 0; i < 5; ++i) EXPECT_EQ(TrailingNumber(lines[static_cast<size_t>(i) + 1]), 7 + i);
 
     sink.StopLogging();

@@ -50,7 +50,8 @@ TEST(ConnectionStrings, AcceptedForms) {
     std::string error;
     auto c = ParseConnectionString(
         " Endpoint = sb://Contoso-NS.servicebus.windows.net/ ; sharedaccesskeyname=Root;"
-        "SharedAccessKey=abc=def==;EntityPath=telemetry;", error);
+        "SharedAccessKey=abc=def==;EntityPath=telemetry;",
+        error);
     ASSERT_TRUE(c) << error;
     EXPECT_EQ(c->host, "contoso-ns.servicebus.windows.net");
     EXPECT_EQ(c->port, 0);
@@ -60,9 +61,10 @@ TEST(ConnectionStrings, AcceptedForms) {
     EXPECT_FALSE(c->emulator);
     EXPECT_EQ(c->NamespaceName(), "contoso-ns");
 
-    c = ParseConnectionString("Endpoint=sb://ns.servicebus.windows.net;SharedAccessSignature=SharedAccessSignature "
-                              "sr=x&sig=y&se=1&skn=k",
-                              error);
+    c = ParseConnectionString(
+        "Endpoint=sb://ns.servicebus.windows.net;SharedAccessSignature=SharedAccessSignature "
+        "sr=x&sig=y&se=1&skn=k",
+        error);
     ASSERT_TRUE(c) << error;
     EXPECT_EQ(c->sharedSignature, "SharedAccessSignature sr=x&sig=y&se=1&skn=k");
 
@@ -80,7 +82,7 @@ TEST(ConnectionStrings, RejectedFormsNameNoSecret) {
     const char* bad[] = {
         "",
         "garbage",
-        "SharedAccessKeyName=k;SharedAccessKey=SECRETKEY",                                // no endpoint
+        "SharedAccessKeyName=k;SharedAccessKey=SECRETKEY",                                     // no endpoint
         "Endpoint=ns.servicebus.windows.net;SharedAccessKeyName=k;SharedAccessKey=SECRETKEY",  // no scheme
         "Endpoint=ftp://ns;SharedAccessKeyName=k;SharedAccessKey=SECRETKEY",
         "Endpoint=sb://ns/path;SharedAccessKeyName=k;SharedAccessKey=SECRETKEY",
@@ -89,13 +91,15 @@ TEST(ConnectionStrings, RejectedFormsNameNoSecret) {
         "Endpoint=sb://ns:99999;SharedAccessKeyName=k;SharedAccessKey=SECRETKEY",
         "Endpoint=sb://ns:;SharedAccessKeyName=k;SharedAccessKey=SECRETKEY",
         "Endpoint=sb://bad host;SharedAccessKeyName=k;SharedAccessKey=SECRETKEY",
-        "Endpoint=sb://ns;SharedAccessKeyName=k",                                          // key missing
-        "Endpoint=sb://ns;SharedAccessKey=SECRETKEY",                                      // key name missing
-        "Endpoint=sb://ns;SharedAccessKeyName=k;SharedAccessKey=SECRETKEY;SharedAccessSignature=SharedAccessSignature sr=a&sig=b",
-        "Endpoint=sb://ns;SharedAccessSignature=SECRETKEY",                                 // not a token
+        "Endpoint=sb://ns;SharedAccessKeyName=k",      // key missing
+        "Endpoint=sb://ns;SharedAccessKey=SECRETKEY",  // key name missing
+        "Endpoint=sb://ns;SharedAccessKeyName=k;SharedAccessKey=SECRETKEY;SharedAccessSignature=SharedAccessSignature "
+        "sr=a&sig=b",
+        "Endpoint=sb://ns;SharedAccessSignature=SECRETKEY",  // not a token
         "Endpoint=sb://ns;SharedAccessKeyName=k;SharedAccessKey=SECRETKEY;EntityPath=a b",
         "Endpoint=sb://ns;SharedAccessKeyName=k;SharedAccessKey=SECRETKEY;EntityPath=../x",
-        "Endpoint=sb://ns.servicebus.windows.net;SharedAccessKeyName=k;SharedAccessKey=SECRETKEY;UseDevelopmentEmulator=true",
+        "Endpoint=sb://"
+        "ns.servicebus.windows.net;SharedAccessKeyName=k;SharedAccessKey=SECRETKEY;UseDevelopmentEmulator=true",
         "Endpoint=sb://128.0.0.1;SharedAccessKeyName=k;SharedAccessKey=SECRETKEY;UseDevelopmentEmulator=true",
         "Endpoint=sb://localhost;SharedAccessKeyName=k;SharedAccessKey=SECRETKEY;UseDevelopmentEmulator=yes",
         "Endpoint=sb://localhost;novalue;SharedAccessKeyName=k;SharedAccessKey=SECRETKEY",
@@ -198,8 +202,7 @@ TEST(LogRecords, SecretsAreMaskedEverywhere) {
     // A renewed token's signature joins the last one; the one before that is dropped.
     log.AddSignature(1, "second-signature-text");
     log.AddSignature(1, "third-signature-text");
-    EXPECT_EQ(log.Mask("ab+/cdEFgh+/ij= second-signature-text third-signature-text"),
-              "ab+/cdEFgh+/ij= *** ***");
+    EXPECT_EQ(log.Mask("ab+/cdEFgh+/ij= second-signature-text third-signature-text"), "ab+/cdEFgh+/ij= *** ***");
 
     // Tokens and keys never seen are masked by their names.
     EXPECT_EQ(log.Mask("got 'SharedAccessSignature sr=x%3A&sig=AbC&se=1&skn=k' and sig=QQ%3D&se=2"),
@@ -221,7 +224,10 @@ TEST(LogRecords, QuotedTextsAreShortenedByCharacters) {
 }
 
 TEST(TextConversion, MalformedInputBecomesReplacementCharacters) {
-    EXPECT_EQ(ToUtf8(std::u16string(u"a\xD800" u"b\U0001F600")), "a\xEF\xBF\xBD" "b\xF0\x9F\x98\x80");
+    EXPECT_EQ(ToUtf8(std::u16string(u"a\xD800"
+                                    u"b\U0001F600")),
+              "a\xEF\xBF\xBD"
+              "b\xF0\x9F\x98\x80");
     EXPECT_EQ(ToUtf16("a\xC3\xA9\xF0\x9F\x98\x80"), u"a\u00e9\U0001F600");
     EXPECT_EQ(ToUtf16("\xFF"), u"\uFFFD");
     EXPECT_EQ(ToUtf16("\xC0\x80"), u"\uFFFD") << "overlong";

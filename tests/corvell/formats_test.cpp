@@ -80,16 +80,16 @@ TEST(BondEncoding, RowsMessageBytes) {
     text.isText = true;
     buffer.Add(text);  // project empty, time 0, milliseconds 0, status 0: left out
     EXPECT_EQ(Hex(buffer.Compose(0, 2)),
-              "43 42 01 00 0B 0A 02 "                      // marshal header, field 0 list of 2 structs
-              "09 05 4C 69 6E 65 31 "                      // 0: project "Line1"
-              "29 05 53 70 65 65 64 "                      // 1: variable "Speed"
-              "48 00 00 00 00 00 80 35 40 "                // 2: value 21.5
-              "B1 80 C4 9F D5 0C "                         // 5: time 1700000000 (zigzag)
-              "C4 06 FA 01 "                               // 6: milliseconds 250
-              "C6 07 81 80 80 80 10 "                      // 7: status 2^32 + 1
-              "00 "                                        // end of row
-              "29 01 54 69 02 6F 6E 82 01 00 "             // variable "T", text "on", isText true
-              "00");                                       // end of Rows
+              "43 42 01 00 0B 0A 02 "           // marshal header, field 0 list of 2 structs
+              "09 05 4C 69 6E 65 31 "           // 0: project "Line1"
+              "29 05 53 70 65 65 64 "           // 1: variable "Speed"
+              "48 00 00 00 00 00 80 35 40 "     // 2: value 21.5
+              "B1 80 C4 9F D5 0C "              // 5: time 1700000000 (zigzag)
+              "C4 06 FA 01 "                    // 6: milliseconds 250
+              "C6 07 81 80 80 80 10 "           // 7: status 2^32 + 1
+              "00 "                             // end of row
+              "29 01 54 69 02 6F 6E 82 01 00 "  // variable "T", text "on", isText true
+              "00");                            // end of Rows
     EXPECT_EQ(buffer.MessageSize(0, 2), buffer.Compose(0, 2).size());
 }
 
@@ -104,9 +104,10 @@ TEST(JsonEncoding, ExactRowText) {
     text.time = 0;
     text.milliseconds = 7;
     buffer.Add(text);
-    EXPECT_EQ(buffer.Compose(0, 2),
-              R"([{"project":"Line1","variable":"Speed","value":12.5,"time":"2023-11-14T22:13:20.250Z","status":18446744073709551615},)"
-              R"({"project":"Line1","variable":"Speed","value":"a\"b\\c\n\u0001","time":"1970-01-01T00:00:00.007Z","status":0}])");
+    EXPECT_EQ(
+        buffer.Compose(0, 2),
+        R"([{"project":"Line1","variable":"Speed","value":12.5,"time":"2023-11-14T22:13:20.250Z","status":18446744073709551615},)"
+        R"({"project":"Line1","variable":"Speed","value":"a\"b\\c\n\u0001","time":"1970-01-01T00:00:00.007Z","status":0}])");
     EXPECT_EQ(buffer.MessageSize(0, 2), buffer.Compose(0, 2).size());
     EXPECT_EQ(buffer.MessageSize(1, 2), buffer.Compose(1, 2).size());
 }
@@ -155,10 +156,10 @@ TEST(IsoTime, CalendarEdges) {
 TEST(AllFormats, AwkwardTextsRoundTrip) {
     const std::u16string samples[] = {
         u"plain",
-        u"\u00e9\u4e2d\U0001F600",                  // 2, 3 and 4 UTF-8 bytes
-        std::u16string(u"lone\xD800high"),          // lone high surrogate
-        std::u16string(u"lone\xDC00low"),           // lone low surrogate
-        std::u16string(u"end\xD83D"),               // high surrogate at the end
+        u"\u00e9\u4e2d\U0001F600",          // 2, 3 and 4 UTF-8 bytes
+        std::u16string(u"lone\xD800high"),  // lone high surrogate
+        std::u16string(u"lone\xDC00low"),   // lone low surrogate
+        std::u16string(u"end\xD83D"),       // high surrogate at the end
         u"quotes \" ' & < > ]]> \\ / \t\r\n",
         std::u16string(u"ctl\x01\x1f\x7f", 6),
         std::u16string(u"nul\0in", 6),

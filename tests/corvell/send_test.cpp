@@ -108,8 +108,8 @@ Row ToRow(const TestRow& t) {
     return row;
 }
 
-bool SendRows(AzureClient& client, const std::string& connection, const std::string& entity, bool eventHub,
-              int format, const std::vector<TestRow>& rows) {
+bool SendRows(AzureClient& client, const std::string& connection, const std::string& entity, bool eventHub, int format,
+              const std::vector<TestRow>& rows) {
     if (!client.Begin(QString::fromStdString(connection).toStdU16String(),
                       QString::fromStdString(entity).toStdU16String(), eventHub, format))
         return false;
@@ -217,8 +217,7 @@ TEST_F(SendTest, RowsArriveIntactInEveryFormatAndMode) {
         for (const bool eventHub : {false, true}) {
             ASSERT_TRUE(server().Reset());
             const std::string entity = eventHub ? "hub-1" : "queue.1";
-            ASSERT_TRUE(SendRows(client, server().ConnectionString(), entity, eventHub, format, rows))
-                << logger.All();
+            ASSERT_TRUE(SendRows(client, server().ConnectionString(), entity, eventHub, format, rows)) << logger.All();
             const auto received = server().Rows();
             ExpectArrived(rows, received, entity);
             const char* formats[] = {"XML", "JSON", "BOND"};
@@ -441,8 +440,10 @@ TEST_F(SendTest, RecordsQuoteNamesAndServiceTextsWithinABound) {
     huge.variable = std::u16string(300000, u'v');
     EXPECT_FALSE(client.Add(ToRow(huge)));
     EXPECT_FALSE(client.Begin(connection, std::u16string(300000, u'e'), false, 1));
-    EXPECT_FALSE(client.Begin(u"Endpoint=" + std::u16string(300000, u's') + u"://x/;SharedAccessKeyName=k;"
-                              u"SharedAccessKey=k-text", u"q", false, 1));
+    EXPECT_FALSE(client.Begin(u"Endpoint=" + std::u16string(300000, u's') +
+                                  u"://x/;SharedAccessKeyName=k;"
+                                  u"SharedAccessKey=k-text",
+                              u"q", false, 1));
 
     // The receiver's 404 quotes the entity name of 260 characters.
     auto limited = StartServer({"--entity", "known"});

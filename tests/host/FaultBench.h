@@ -73,8 +73,9 @@ public:
         m_logFile = m_folder.Path("gateway.log");
         m_environment = QProcessEnvironment::systemEnvironment();
         m_environment.insert("SKYVANE_AUTOMATION_DIR", QString::fromStdString(Sockets()));
-        m_environment.insert("BRENNIC_CONFIG", QString::fromStdString(m_folder.Write(
-                                                   "brennic.ini", "[file]\npath = " + m_logFile + "\n[stderr]\nenabled = no\n")));
+        m_environment.insert("BRENNIC_CONFIG",
+                             QString::fromStdString(m_folder.Write("brennic.ini", "[file]\npath = " + m_logFile +
+                                                                                      "\n[stderr]\nenabled = no\n")));
     }
     ~FaultBench() {
         if (m_receiver && !m_epochs.empty()) std::printf("[ ledger   ] %s\n", Account().Text().c_str());
@@ -99,8 +100,8 @@ public:
     bool Fault(const std::string& query) { return m_receiver->Fault(query); }
     std::string Connection(int port, const std::string& key = azurelocal::AzureLocalProcess::kKey,
                            bool emulator = true) const {
-        return "Endpoint=sb://127.0.0.1:" + std::to_string(port) + "/;SharedAccessKeyName=" +
-               azurelocal::AzureLocalProcess::kKeyName + ";SharedAccessKey=" + key +
+        return "Endpoint=sb://127.0.0.1:" + std::to_string(port) +
+               "/;SharedAccessKeyName=" + azurelocal::AzureLocalProcess::kKeyName + ";SharedAccessKey=" + key +
                (emulator ? ";UseDevelopmentEmulator=true" : "");
     }
 
@@ -175,16 +176,18 @@ public:
         for (const std::string& project : kProjects)
             for (int i = 1; i <= kPerProject; ++i)
                 text += "NAME_" + std::to_string(n++) + "=" + project + "#C" + std::to_string(i) + "\n";
-        const std::string connection =
-            settings.connection.empty() ? Connection(m_receiver->Port()) : settings.connection;
-        text += "[CONNECTIONS]\nCOUNT=1\nCONN_0=" + connection + "\nQUEUE_0=" + settings.entity + "\nMODE_0=0\nFORMAT_0=1\n";
+        const std::string connection = settings.connection.empty() ? Connection(m_receiver->Port())
+                                                                   : settings.connection;
+        text += "[CONNECTIONS]\nCOUNT=1\nCONN_0=" + connection + "\nQUEUE_0=" + settings.entity +
+                "\nMODE_0=0\nFORMAT_0=1\n";
         return m_folder.Write("settings.ini", text);
     }
     // Starts the gateway and waits until the module runs.
     bool StartGateway() { return StartGateway(Settings{}); }
     bool StartGateway(const Settings& settings) {
-        m_gateway = std::make_unique<GatewayProcess>(
-            std::vector<std::string>{"run", "--ini", WriteSettings(settings), "--status-interval", "1"}, m_environment);
+        m_gateway = std::make_unique<GatewayProcess>(std::vector<std::string>{"run", "--ini", WriteSettings(settings),
+                                                                              "--status-interval", "1"},
+                                                     m_environment);
         const bool runs = WaitForModuleRun();
         EXPECT_TRUE(runs) << m_gateway->Errors();
         return runs;
@@ -239,7 +242,8 @@ public:
             messages.insert(row.messageId);
         }
         for (const Epoch& epoch : m_epochs)
-            for (const auto& [project, ticks] : epoch.ticks) ledger.produced += static_cast<size_t>(ticks) * kPerProject;
+            for (const auto& [project, ticks] : epoch.ticks)
+                ledger.produced += static_cast<size_t>(ticks) * kPerProject;
         ReadRecords(ledger);
         return ledger;
     }
@@ -319,7 +323,8 @@ private:
         for (const Epoch& epoch : m_epochs) {
             const auto ticks = epoch.ticks.find(row.project);
             if (ticks == epoch.ticks.end()) continue;
-            const double first = static_cast<double>(epoch.base + 1), last = static_cast<double>(epoch.base + ticks->second);
+            const double first = static_cast<double>(epoch.base + 1),
+                         last = static_cast<double>(epoch.base + ticks->second);
             if (!row.isText && row.value >= first && row.value <= last && row.value == static_cast<long>(row.value))
                 return true;
         }
@@ -356,9 +361,9 @@ private:
                 line.find("Online Rows failed") != std::string::npos &&
                 std::sscanf(line.c_str() + at, "Adding of %d Online Rows failed", &count) == 1)
                 ledger.failedRows += static_cast<size_t>(count);
-            else if (line.find("Value change queue full") != std::string::npos)
-                ++ledger.dropped;
-            else if (line.find("queued value changes") != std::string::npos && line.find("are lost") != std::string::npos)
+            else if (line.find("Value change queue full") != std::string::npos) ++ledger.dropped;
+            else if (line.find("queued value changes") != std::string::npos &&
+                     line.find("are lost") != std::string::npos)
                 ledger.discarded += static_cast<size_t>(QueuedCount(line));
         }
     }

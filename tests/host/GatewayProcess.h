@@ -36,8 +36,9 @@ public:
         // must not find one that someone else runs on this machine.
         QProcessEnvironment isolated = environment;
         if (!isolated.contains("SKYVANE_AUTOMATION_DIR"))
-            isolated.insert("SKYVANE_AUTOMATION_DIR", QDir::temp().filePath(QString("skyvane-gateway-test-%1-no-runtime")
-                                                                                .arg(QCoreApplication::applicationPid())));
+            isolated.insert("SKYVANE_AUTOMATION_DIR",
+                            QDir::temp().filePath(
+                                QString("skyvane-gateway-test-%1-no-runtime").arg(QCoreApplication::applicationPid())));
         std::vector<std::string> args{BinDir() + "/skyvane-gateway"};
         args.insert(args.end(), arguments.begin(), arguments.end());
         std::vector<std::string> env;
@@ -78,8 +79,7 @@ public:
     int WaitForExit(int timeoutMs = 15000) {
         if (m_pid <= 0) return m_exitCode;
         const auto deadline = Deadline(timeoutMs);
-        while (ReadMore(deadline)) {
-        }
+        while (ReadMore(deadline)) {}
         if (m_out >= 0 || m_err >= 0) return -1;  // still writing at the deadline
         const int pidfd = static_cast<int>(syscall(SYS_pidfd_open, m_pid, 0));
         if (pidfd < 0) return -1;

@@ -41,7 +41,9 @@ TEST_P(FaultMatrix, EveryChangeArrivesOrIsRecordedAsLost) {
     const MatrixCase& c = GetParam();
     FaultBench bench;
     QStringList arguments;
-    if (c.target == Target::MissingEntity) arguments << "--entity" << "elsewhere";
+    if (c.target == Target::MissingEntity)
+        arguments << "--entity"
+                  << "elsewhere";
     if (c.target == Target::UnverifiedTls) {
         std::string certificate, key;
         ASSERT_TRUE(azurelocal::MakeSelfSignedCertificate(bench.Folder().Path(), certificate, key));
@@ -83,7 +85,8 @@ INSTANTIATE_TEST_SUITE_P(
         MatrixCase{"EntityNotFound404", "", true, Target::MissingEntity},
         MatrixCase{"TooLarge413Once", "kind=status&status=413&count=1", false},
         // Three ticks wait in the queue while the worker waits to retry: no more than it holds.
-        MatrixCase{"Throttled429RetryAfter", "kind=status&status=429&count=2&retry-after=1", false, Target::Receiver, 3},
+        MatrixCase{"Throttled429RetryAfter", "kind=status&status=429&count=2&retry-after=1", false, Target::Receiver,
+                   3},
         MatrixCase{"Unavailable503RetryAfter", "kind=status&status=503&count=2&retry-after=1", false, Target::Receiver,
                    3},
         // Ten ticks during a 3 s retry overflow the queue: dropped, and recorded so.
@@ -253,8 +256,8 @@ std::vector<std::string> Signatures(const std::string& resource, const std::stri
         const std::string signed_ = PercentEncoded(resource) + "\n" + std::to_string(expiry);
         unsigned char mac[EVP_MAX_MD_SIZE];
         unsigned int size = 0;
-        HMAC(EVP_sha256(), key.data(), static_cast<int>(key.size()), reinterpret_cast<const unsigned char*>(signed_.data()),
-             signed_.size(), mac, &size);
+        HMAC(EVP_sha256(), key.data(), static_cast<int>(key.size()),
+             reinterpret_cast<const unsigned char*>(signed_.data()), signed_.size(), mac, &size);
         const std::string plain = Base64(mac, size);
         std::string url = plain;
         for (char& c : url) c = c == '+' ? '-' : c == '/' ? '_' : c;
@@ -316,7 +319,8 @@ TEST(FaultMatrixSecrets, NoKeySignatureOrPasswordInAnythingTheGatewayWrites) {
     const std::int64_t lastToken = std::time(nullptr);
 
     const std::string log = TempFolder::Read(bench.LogFile());
-    EXPECT_NE(log.find("was checked with the key"), std::string::npos) << "the refusals quoting the secrets were logged";
+    EXPECT_NE(log.find("was checked with the key"), std::string::npos)
+        << "the refusals quoting the secrets were logged";
     written += log;
     EXPECT_EQ(TempFolder::Read(settingsFile), settingsText) << "the gateway does not write its settings file";
     EXPECT_EQ(settingsText.find(password), std::string::npos) << "the settings file holds the password enciphered";

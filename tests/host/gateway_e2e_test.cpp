@@ -21,7 +21,8 @@ struct Target {
     int format;  // 0 XML, 1 JSON, 2 BOND
 };
 
-const char* const kVariables[] = {"Plant#Tank1.Level", "Plant#Pump1.Speed", "Plant#Pump1.State", "Utilities#Water.Flow"};
+const char* const kVariables[] = {"Plant#Tank1.Level", "Plant#Pump1.Speed", "Plant#Pump1.State",
+                                  "Utilities#Water.Flow"};
 
 class GatewayEndToEnd : public ::testing::Test {
 protected:
@@ -32,8 +33,9 @@ protected:
         // The module's log goes to a file of the test's own, not to standard error.
         m_logFile = m_folder.Path("gateway.log");
         m_environment = QProcessEnvironment::systemEnvironment();
-        m_environment.insert("BRENNIC_CONFIG", QString::fromStdString(m_folder.Write(
-                                                   "brennic.ini", "[file]\npath = " + m_logFile + "\n[stderr]\nenabled = no\n")));
+        m_environment.insert("BRENNIC_CONFIG",
+                             QString::fromStdString(m_folder.Write("brennic.ini", "[file]\npath = " + m_logFile +
+                                                                                      "\n[stderr]\nenabled = no\n")));
     }
 
     std::string WriteSettings(const std::vector<Target>& targets, const std::string& extraVariable = {}) {
@@ -57,7 +59,9 @@ protected:
         return std::make_unique<GatewayProcess>(args, m_environment);
     }
 
-    static std::string Project() { return std::string(std::getenv("SKYVANE_SOURCE_DIR")) + "/tarvo/examples/plant.json"; }
+    static std::string Project() {
+        return std::string(std::getenv("SKYVANE_SOURCE_DIR")) + "/tarvo/examples/plant.json";
+    }
 
     // Rows received per entity, and the formats each entity received.
     std::map<std::string, size_t> RowsPerEntity(std::map<std::string, std::set<std::string>>* formats = nullptr) {
@@ -153,8 +157,8 @@ TEST_F(GatewayEndToEnd, StartedBeforeTheRuntimeItKeepsTryingAndThenSends) {
     EXPECT_NE(gateway->WaitForText("start attempt 1 failed: no SCADA runtime is reachable"), "") << gateway->Errors();
     EXPECT_NE(gateway->WaitForText("the runtime stand-in runs"), "");
     EXPECT_NE(gateway->WaitForLine([](const std::string& line) {
-                  return line.find("start attempt") != std::string::npos && line.find("the module runs") != std::string::npos;
-              }),
+        return line.find("start attempt") != std::string::npos && line.find("the module runs") != std::string::npos;
+    }),
               "");
     ASSERT_NE(gateway->WaitForLine(IsStatusWithRows), "");
     EXPECT_GE(StopWith(*gateway, SIGTERM), 0);

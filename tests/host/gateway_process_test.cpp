@@ -13,8 +13,8 @@
 namespace {
 
 std::string FakeIni(const TempFolder& folder, const std::string& fake) {
-    return folder.Write("settings.ini", "[Azure]\nINTEGRITYPERIOD=5\n[Fake]\nCALLS=" + folder.Path("calls.log") +
-                                            "\n" + fake);
+    return folder.Write("settings.ini",
+                        "[Azure]\nINTEGRITYPERIOD=5\n[Fake]\nCALLS=" + folder.Path("calls.log") + "\n" + fake);
 }
 
 std::vector<std::string> Calls(const TempFolder& folder) {
@@ -65,7 +65,8 @@ TEST(GatewayProcess, BadStartsEndWithTheirExitCodeAndOneClearLine) {
         {{"run", "--ini", ini, "--module", GatewayProcess::FakeModule("incomplete")}, 1, "lacks the export 'dll_exit'"},
         {{"run", "--ini", ini, "--module", GatewayProcess::FakeModule(), "--metrics-file",
           folder.Path("no/such/folder/m.prom")},
-         2, "m.prom"},
+         2,
+         "m.prom"},
     };
     for (const Case& c : cases) {
         GatewayProcess gateway(c.args);
@@ -87,8 +88,8 @@ TEST(GatewayProcess, CountsTheModulesCyclesIntoStatusLinesAndMetricsAndStopsOnSi
                             "--metrics-file", metrics});
     ASSERT_NE(gateway.WaitForText("start attempt 1: the module runs"), "");
     ASSERT_NE(gateway.WaitForLine([](const std::string& line) {
-                  return line.find("status: ") != std::string::npos && line.find(" 0 cycles") == std::string::npos;
-              }),
+        return line.find("status: ") != std::string::npos && line.find(" 0 cycles") == std::string::npos;
+    }),
               "");
     gateway.Signal(SIGTERM);
     EXPECT_EQ(gateway.WaitForExit(), 0);
@@ -128,7 +129,8 @@ TEST(GatewayProcess, RetriesInitWithGrowingPausesWhileNoRuntimeIsThere) {
     gateway.Signal(SIGINT);
     EXPECT_EQ(gateway.WaitForExit(), 0);
     size_t said = 0;
-    for (const std::string& line : gateway.Lines()) said += line.find("no SCADA runtime is reachable yet") != std::string::npos;
+    for (const std::string& line : gateway.Lines())
+        said += line.find("no SCADA runtime is reachable yet") != std::string::npos;
     EXPECT_EQ(said, 1u) << "said once";
     // A failed init is followed by dll_exit before the next one.
     EXPECT_EQ(Calls(folder), (std::vector<std::string>{"init", "dll_exit", "init", "dll_exit", "init", "dll_exit"}));
@@ -161,18 +163,22 @@ TEST(GatewayProcess, SighupRestartsReportsAFailedRestartAndKeepsSettingsItCannot
     FakeIni(folder, "RESTART=0\n");
     gateway.Signal(SIGHUP);
     EXPECT_NE(gateway.WaitForText("could not restart the export (message 1126)"), "");
-    EXPECT_NE(gateway.WaitForText("reload failed: the export did not restart with the new settings; next attempt in 1 s"), "");
+    EXPECT_NE(gateway.WaitForText(
+                  "reload failed: the export did not restart with the new settings; next attempt in 1 s"),
+              "");
     EXPECT_NE(gateway.WaitForText("start attempt 2: the module runs"), "");
 
     std::filesystem::rename(ini, folder.Path("moved.ini"));
     gateway.Signal(SIGHUP);
-    EXPECT_NE(gateway.WaitForText("reload refused: settings file '" + ini + "' does not exist; the running settings stay"), "");
+    EXPECT_NE(gateway.WaitForText("reload refused: settings file '" + ini +
+                                  "' does not exist; the running settings stay"),
+              "");
     std::filesystem::rename(folder.Path("moved.ini"), ini);
 
     gateway.Signal(SIGTERM);
     EXPECT_EQ(gateway.WaitForExit(), 0);
-    EXPECT_EQ(Calls(folder), (std::vector<std::string>{"init", "exec_action", "exec_action", "dll_exit", "init",
-                                                       "dll_exit"}));
+    EXPECT_EQ(Calls(folder),
+              (std::vector<std::string>{"init", "exec_action", "exec_action", "dll_exit", "init", "dll_exit"}));
 }
 
 TEST(GatewayProcess, ConfigureStartsTheModuleRunsKonfigAndStopsIt) {

@@ -16,8 +16,7 @@ namespace {
 // Runs the event loop until the condition holds or five seconds pass.
 bool RunUntil(const std::function<bool()>& condition) {
     QDeadlineTimer deadline(5000);
-    while (!condition() && !deadline.hasExpired())
-        QCoreApplication::processEvents(QEventLoop::WaitForMoreEvents, 100);
+    while (!condition() && !deadline.hasExpired()) QCoreApplication::processEvents(QEventLoop::WaitForMoreEvents, 100);
     return condition();
 }
 

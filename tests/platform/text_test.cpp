@@ -63,9 +63,12 @@ TEST(CStringFormat, MismatchedOrMissingArgumentsNeverMisread) {
 }
 
 TEST(CStringUtf8, InvalidInputBecomesReplacementCharacters) {
-    EXPECT_EQ(CString::FromUtf8("a\xFF" "b").Str(), std::u16string(u"a\uFFFDb"));
+    EXPECT_EQ(CString::FromUtf8("a\xFF"
+                                "b")
+                  .Str(),
+              std::u16string(u"a\uFFFDb"));
     EXPECT_EQ(CString::FromUtf8("\xE2\x82").Str(), std::u16string(u"\uFFFD"));      // truncated sequence
-    EXPECT_EQ(CString::FromUtf8("\xC0\xAF/").Str(), std::u16string(u"\uFFFD/"));      // overlong '/' is refused
+    EXPECT_EQ(CString::FromUtf8("\xC0\xAF/").Str(), std::u16string(u"\uFFFD/"));    // overlong '/' is refused
     EXPECT_EQ(CString::FromUtf8("\xED\xA0\x80").Str(), std::u16string(u"\uFFFD"));  // encoded surrogate
     const char16_t lone[] = {u'x', 0xD800, u'y', 0xDC00, 0};
     EXPECT_EQ(CString(lone).ToUtf8(), "x\xEF\xBF\xBDy\xEF\xBF\xBD");

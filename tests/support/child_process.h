@@ -53,10 +53,8 @@ inline pid_t StartChild(const std::vector<std::string>& arguments, ChildStreams 
     if (streams.out >= 0) ::dup2(streams.out, STDOUT_FILENO);
     if (streams.err >= 0) ::dup2(streams.err, STDERR_FILENO);
     if (!folder.empty() && ::chdir(folder.c_str()) != 0) ::_exit(126);
-    if (environment)
-        ::execve(argv[0], argv.data(), envp.data());
-    else
-        ::execv(argv[0], argv.data());
+    if (environment) ::execve(argv[0], argv.data(), envp.data());
+    else ::execv(argv[0], argv.data());
     ::_exit(127);
 }
 
@@ -82,7 +80,8 @@ inline ChildResult RunChild(const std::vector<std::string>& arguments, bool with
     const auto deadline = std::chrono::steady_clock::now() + std::chrono::milliseconds(timeoutMs);
     bool ended = false;
     for (;;) {
-        const auto left = std::chrono::duration_cast<std::chrono::milliseconds>(deadline - std::chrono::steady_clock::now());
+        const auto left =
+            std::chrono::duration_cast<std::chrono::milliseconds>(deadline - std::chrono::steady_clock::now());
         pollfd wait{out[0], POLLIN, 0};
         if (::poll(&wait, 1, static_cast<int>(std::max<long long>(0, left.count()))) <= 0) break;
         char buffer[4096];

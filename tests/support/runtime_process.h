@@ -29,8 +29,10 @@ public:
 
     // Starts tarvo-runtime PROJECT_FILE --socket-dir DIR plus options and waits
     // up to 20 s for its "ready" line. False (with what it said) otherwise.
-    bool Start(const std::string& projectFile, const std::string& socketDir, const std::vector<std::string>& options = {}) {
-        const std::string program = (std::filesystem::read_symlink("/proc/self/exe").parent_path() / "tarvo-runtime").string();
+    bool Start(const std::string& projectFile, const std::string& socketDir,
+               const std::vector<std::string>& options = {}) {
+        const std::string program =
+            (std::filesystem::read_symlink("/proc/self/exe").parent_path() / "tarvo-runtime").string();
         std::vector<std::string> args{program, projectFile, "--socket-dir", socketDir};
         args.insert(args.end(), options.begin(), options.end());
         {

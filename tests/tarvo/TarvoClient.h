@@ -106,8 +106,8 @@ class RuntimeTest : public ::testing::Test {
 protected:
     void SetUp() override {
         m_liveBefore = tarvo::Runtime::LiveObjects();
-        runtime = std::make_unique<tarvo::Runtime>(
-            SmallPlant(), tarvo::RuntimeOptions{tarvo::Delivery::CallerThread, false});
+        runtime =
+            std::make_unique<tarvo::Runtime>(SmallPlant(), tarvo::RuntimeOptions{tarvo::Delivery::CallerThread, false});
         std::string error;
         ASSERT_TRUE(runtime->Start(&error)) << error;
     }

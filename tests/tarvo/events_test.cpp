@@ -105,7 +105,8 @@ TEST_F(TarvoEvents, BulkChangeLayout) {
             return S_OK;
         }
         IUnknown* FindInterface(REFIID iid) override {
-            return iid == DIID_IOnlineVariableEvents ? static_cast<IDispatch*>(this) : CDispatchObject::FindInterface(iid);
+            return iid == DIID_IOnlineVariableEvents ? static_cast<IDispatch*>(this)
+                                                     : CDispatchObject::FindInterface(iid);
         }
     };
     auto probe = MakeComObject<ByRefProbe>(&byReference);
@@ -127,7 +128,7 @@ TEST_F(TarvoEvents, ContainerReportsOnlyItsNamesWhileStartedAndActive) {
     CallMethodOrThrow(container.Get(), ContainerStart);
     runtime->Tick();  // current values
     sink->ClearCalls();
-    runtime->SetValue(u"Plant", u"State", CComVariant(u"x"));  // not added
+    runtime->SetValue(u"Plant", u"State", CComVariant(u"x"));     // not added
     runtime->SetValue(u"Utilities", u"Power", CComVariant(3.0));  // another project
     runtime->SetValue(u"Plant", u"Level", CComVariant(2.0));
     ASSERT_EQ(sink->CallCount(), 1u);
@@ -253,13 +254,19 @@ TEST(TarvoSimulation, GeneratorsChangeValuesEveryPeriod) {
         setUp(v);
         project.variables.push_back(v);
     };
-    add(u"Ramp", tarvo::GeneratorKind::Ramp, [](auto& v) { v.generator.step = 4; v.generator.maximum = 10; });
+    add(u"Ramp", tarvo::GeneratorKind::Ramp, [](auto& v) {
+        v.generator.step = 4;
+        v.generator.maximum = 10;
+    });
     add(u"Text", tarvo::GeneratorKind::TextCycle, [](auto& v) {
         v.isText = true;
         v.text = u"b";
         v.generator.texts = {u"a", u"b", u"c"};
     });
-    add(u"Flip", tarvo::GeneratorKind::StatusFlip, [](auto& v) { v.status = 1; v.generator.alternateStatus = 1ull << 40; });
+    add(u"Flip", tarvo::GeneratorKind::StatusFlip, [](auto& v) {
+        v.status = 1;
+        v.generator.alternateStatus = 1ull << 40;
+    });
     add(u"Walk", tarvo::GeneratorKind::RandomWalk, [](auto& v) {
         v.number = 5;
         v.generator.step = 3;
@@ -338,7 +345,8 @@ TEST(TarvoSimulation, RateIsSpreadEvenlyOverTheTicksUntilTheStop) {
         ASSERT_EQ(sink->CallCount(), 1u) << "tick " << tick;
         const BulkChange change = ReadBulkChange(sink->Calls()[0]);
         EXPECT_EQ(change.ids.size(), 500u) << "tick " << tick;
-        for (size_t k = 0; k < change.ids.size(); ++k) perVariable[static_cast<size_t>(change.ids[k]) - 1] = change.values[k].dblVal;
+        for (size_t k = 0; k < change.ids.size(); ++k)
+            perVariable[static_cast<size_t>(change.ids[k]) - 1] = change.values[k].dblVal;
     }
     // 110 ms of simulated time: the first half changed first at 0.02 to 10 ms,
     // six times since; the second half at 10.02 to 20 ms, five times.

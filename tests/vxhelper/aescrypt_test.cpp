@@ -52,7 +52,8 @@ TEST(AesCrypt, DamagedFormsAndOtherKeysAreDetected) {
 TEST(AesCrypt, TextsThatAreNotValidUtf16AreRefusedAndKept) {
     const CAesCrypt crypt(kHigh, kLow);
     // A lone surrogate has no UTF-8 form; enciphering it would give back U+FFFD.
-    for (const std::u16string& chars : {std::u16string(u"pass") + char16_t(0xD83D), std::u16string(1, char16_t(0xDC00)) + u"x"}) {
+    for (const std::u16string& chars :
+         {std::u16string(u"pass") + char16_t(0xD83D), std::u16string(1, char16_t(0xDC00)) + u"x"}) {
         CString text(chars);
         EXPECT_FALSE(crypt.EncryptHexString(text));
         EXPECT_EQ(text.View(), chars);

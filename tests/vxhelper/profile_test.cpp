@@ -242,7 +242,7 @@ TEST_F(ProfileTest, WriteKeepsEveryOtherLineByteForByte) {
 TEST_F(ProfileTest, RefusesWhatIsNoLineOrNoFile) {
     WriteBytes(file, "[s]\nk=v\n");
     const LPCWSTR refused[][3] = {{u"s", u"k", u"two\nlines"}, {u"s", u"k", u"cr\rhere"}, {u"s", u"k=x", u"v"},
-                                  {u"s", u";k", u"v"},          {u"s]x", u"k", u"v"},     {u" ", u"k", u"v"},
+                                  {u"s", u";k", u"v"},         {u"s]x", u"k", u"v"},      {u" ", u"k", u"v"},
                                   {u"s", u"k", nullptr}};
     for (const auto& [section, key, value] : refused)
         EXPECT_FALSE(VX_WritePrivateProfileString(section, key, value, path)) << CString(section).ToUtf8();
@@ -268,8 +268,9 @@ TEST_F(ProfileTest, SessionWritesOnceAtTheEnd) {
     WriteBytes(file, "[s]\nk=old\n");
     {
         VX_CPrivateProfileSession session(path);
-        for (int i = 0; i < 50; ++i) ASSERT_TRUE(VX_WritePrivateProfileInt(u"s", CString::Formatted(u"K%d", i), i, path));
-        EXPECT_EQ(ReadBytes(file), "[s]\nk=old\n");  // nothing written yet
+        for (int i = 0; i < 50; ++i)
+            ASSERT_TRUE(VX_WritePrivateProfileInt(u"s", CString::Formatted(u"K%d", i), i, path));
+        EXPECT_EQ(ReadBytes(file), "[s]\nk=old\n");                     // nothing written yet
         EXPECT_EQ(VX_GetPrivateProfileInt(u"s", u"K49", 0, path), 49);  // but the session reads its writes
         ASSERT_TRUE(VX_WritePrivateProfileString(u"s", u"k", u"gone", path));
         session.Discard();
@@ -290,7 +291,7 @@ TEST_F(ProfileTest, AFailedReplacementLeavesTheFileAsItWas) {
             EXPECT_FALSE(session.Commit());
         }
         EXPECT_EQ(ReadText(path, u"s", u"k"), u"old");  // the changes are gone from the session too
-        EXPECT_TRUE(session.Commit());                   // nothing left to write
+        EXPECT_TRUE(session.Commit());                  // nothing left to write
     }  // the session's end must not write what the failed commit did not
     EXPECT_EQ(ReadBytes(file), original);
 

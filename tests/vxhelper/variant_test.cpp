@@ -45,12 +45,24 @@ TEST(VariantConversion, Numbers) {
     };
     VARIANT v;
     VariantInit(&v);
-    v.vt = VT_I1; v.cVal = -3; EXPECT_EQ(number(v), -3.0);
-    v.vt = VT_UI4; v.ulVal = 4000000000u; EXPECT_EQ(number(v), 4e9);
-    v.vt = VT_UI8; v.ullVal = 1ull << 63; EXPECT_EQ(number(v), 9223372036854775808.0);
-    v.vt = VT_R4; v.fltVal = 0.5f; EXPECT_EQ(number(v), 0.5);
-    v.vt = VT_BOOL; v.boolVal = VARIANT_TRUE; EXPECT_EQ(number(v), 1.0);
-    v.vt = VT_CY; v.cyVal.int64 = 12345; EXPECT_EQ(number(v), 1.2345);
+    v.vt = VT_I1;
+    v.cVal = -3;
+    EXPECT_EQ(number(v), -3.0);
+    v.vt = VT_UI4;
+    v.ulVal = 4000000000u;
+    EXPECT_EQ(number(v), 4e9);
+    v.vt = VT_UI8;
+    v.ullVal = 1ull << 63;
+    EXPECT_EQ(number(v), 9223372036854775808.0);
+    v.vt = VT_R4;
+    v.fltVal = 0.5f;
+    EXPECT_EQ(number(v), 0.5);
+    v.vt = VT_BOOL;
+    v.boolVal = VARIANT_TRUE;
+    EXPECT_EQ(number(v), 1.0);
+    v.vt = VT_CY;
+    v.cyVal.int64 = 12345;
+    EXPECT_EQ(number(v), 1.2345);
     EXPECT_EQ(number(VX_CVariant(u"  -3.5e2 ")), -350.0);
     std::int32_t target = 42;
     VARIANT ref, outer;
@@ -64,11 +76,18 @@ TEST(VariantConversion, Numbers) {
     EXPECT_EQ(number(outer), 42.0);
 
     // No number: no value, errors, interfaces, arrays, null references, other text.
-    v.vt = VT_EMPTY; EXPECT_EQ(number(v), -999.0);
-    v.vt = VT_ERROR; EXPECT_EQ(number(v), -999.0);
-    v.vt = VT_DISPATCH; v.pdispVal = nullptr; EXPECT_EQ(number(v), -999.0);
-    v.vt = VT_ARRAY | VT_I4; v.parray = nullptr; EXPECT_EQ(number(v), -999.0);
-    ref.plVal = nullptr; EXPECT_EQ(number(ref), -999.0);
+    v.vt = VT_EMPTY;
+    EXPECT_EQ(number(v), -999.0);
+    v.vt = VT_ERROR;
+    EXPECT_EQ(number(v), -999.0);
+    v.vt = VT_DISPATCH;
+    v.pdispVal = nullptr;
+    EXPECT_EQ(number(v), -999.0);
+    v.vt = VT_ARRAY | VT_I4;
+    v.parray = nullptr;
+    EXPECT_EQ(number(v), -999.0);
+    ref.plVal = nullptr;
+    EXPECT_EQ(number(ref), -999.0);
     for (LPCWSTR text : {u"", u"12abc", u"nan", u"inf", u"0x10", u"1e999", u"- 1"})
         EXPECT_EQ(number(VX_CVariant(text)), -999.0) << CString(text).ToUtf8();
     VARIANT loop;  // a reference to itself must end, not recurse forever
@@ -84,10 +103,17 @@ TEST(VariantConversion, Texts) {
     VARIANT v;
     VariantInit(&v);
     EXPECT_EQ(_c_funktionVariantToCString(&v), u"");
-    v.vt = VT_I4; v.lVal = 5; EXPECT_EQ(_c_funktionVariantToCString(&v), u"5");
-    v.vt = VT_R8; v.dblVal = 0.1; EXPECT_EQ(_c_funktionVariantToCString(&v), u"0.1");
-    v.vt = VT_CY; v.cyVal.int64 = INT64_MIN; EXPECT_EQ(_c_funktionVariantToCString(&v), u"-922337203685477.5808");
-    v.vt = VT_DATE; v.date = kMarch31_2024 + 3723.25 / 86400;
+    v.vt = VT_I4;
+    v.lVal = 5;
+    EXPECT_EQ(_c_funktionVariantToCString(&v), u"5");
+    v.vt = VT_R8;
+    v.dblVal = 0.1;
+    EXPECT_EQ(_c_funktionVariantToCString(&v), u"0.1");
+    v.vt = VT_CY;
+    v.cyVal.int64 = INT64_MIN;
+    EXPECT_EQ(_c_funktionVariantToCString(&v), u"-922337203685477.5808");
+    v.vt = VT_DATE;
+    v.date = kMarch31_2024 + 3723.25 / 86400;
     EXPECT_EQ(_c_funktionVariantToCString(&v), u"2024-03-31 01:02:03.250");
     VX_CVariant text(u"Line1");
     BSTR target = text.bstrVal;

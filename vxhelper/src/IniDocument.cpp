@@ -54,10 +54,10 @@ bool HasLineBreakOrNul(std::u16string_view text) {
 
 // Windows-1252 from 0x80 to 0x9F; the five bytes it leaves undefined map to
 // the control characters of the same number, as Windows maps them.
-constexpr char16_t kCp1252High[32] = {
-    0x20AC, 0x0081, 0x201A, 0x0192, 0x201E, 0x2026, 0x2020, 0x2021, 0x02C6, 0x2030, 0x0160,
-    0x2039, 0x0152, 0x008D, 0x017D, 0x008F, 0x0090, 0x2018, 0x2019, 0x201C, 0x201D, 0x2022,
-    0x2013, 0x2014, 0x02DC, 0x2122, 0x0161, 0x203A, 0x0153, 0x009D, 0x017E, 0x0178};
+constexpr char16_t kCp1252High[32] = {0x20AC, 0x0081, 0x201A, 0x0192, 0x201E, 0x2026, 0x2020, 0x2021,
+                                      0x02C6, 0x2030, 0x0160, 0x2039, 0x0152, 0x008D, 0x017D, 0x008F,
+                                      0x0090, 0x2018, 0x2019, 0x201C, 0x201D, 0x2022, 0x2013, 0x2014,
+                                      0x02DC, 0x2122, 0x0161, 0x203A, 0x0153, 0x009D, 0x017E, 0x0178};
 
 char16_t FromCp1252(unsigned char byte) {
     return byte >= 0x80 && byte < 0xA0 ? kCp1252High[byte - 0x80] : static_cast<char16_t>(byte);
@@ -112,7 +112,8 @@ VX_CIniDocument VX_CIniDocument::Parse(std::string_view bytes) {
             end = bytes.size();  // last line, without line end (an odd byte of UTF-16 stays in it)
         }
         line.raw = bytes.substr(start, end - start);
-        if (doc.m_newline.empty() && line.endBytes > 0) doc.m_newline = line.raw.substr(line.raw.size() - line.endBytes);
+        if (doc.m_newline.empty() && line.endBytes > 0)
+            doc.m_newline = line.raw.substr(line.raw.size() - line.endBytes);
         doc.Classify(line);
         doc.m_lines.push_back(std::move(line));
         start = end;
@@ -167,8 +168,7 @@ void VX_CIniDocument::BuildIndex() {
         case Kind::Other:
             if (current) current->lastNonBlank = it;
             break;
-        case Kind::Blank:
-            break;
+        case Kind::Blank: break;
         }
     }
 }
@@ -195,9 +195,7 @@ std::optional<std::u16string> VX_CIniDocument::GetValue(std::u16string_view sect
     return k->second->value;
 }
 
-bool VX_CIniDocument::HasSection(std::u16string_view section) const {
-    return m_sectionIndex.contains(Fold(section));
-}
+bool VX_CIniDocument::HasSection(std::u16string_view section) const { return m_sectionIndex.contains(Fold(section)); }
 
 std::vector<std::u16string> VX_CIniDocument::GetKeyNames(std::u16string_view section) const {
     std::vector<std::u16string> names;
@@ -248,8 +246,13 @@ std::string VX_CIniDocument::Encode(std::u16string_view text) const {
     bytes.reserve(text.size() * 2);
     for (const char16_t c : text) {
         const char lo = static_cast<char>(c & 0xFF), hi = static_cast<char>(c >> 8);
-        if (m_encoding == Encoding::Utf16Le) { bytes += lo; bytes += hi; }
-        else { bytes += hi; bytes += lo; }
+        if (m_encoding == Encoding::Utf16Le) {
+            bytes += lo;
+            bytes += hi;
+        } else {
+            bytes += hi;
+            bytes += lo;
+        }
     }
     return bytes;
 }
@@ -300,7 +303,7 @@ bool VX_CIniDocument::SetValue(std::u16string_view section, std::u16string_view 
     // hold it gives way to UTF-16LE for the whole file.
     const auto found = m_sectionIndex.find(Fold(sectionName));
     const bool keyExists = found != m_sectionIndex.end() && m_sections[found->second].keys.contains(Fold(keyName));
-    const std::u16string written = keyExists ? Quote(value)
+    const std::u16string written = keyExists                       ? Quote(value)
                                    : found != m_sectionIndex.end() ? keyLine
                                                                    : u"[" + sectionName + u"]" + keyLine;
     if (!CanEncode(written)) ConvertToUtf16Le();

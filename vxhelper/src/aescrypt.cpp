@@ -72,11 +72,12 @@ bool CAesCrypt::EncryptHexString(CString& text) const {
     unsigned char* tag = cipher + plain.bytes.size();
     CipherCtx ctx(EVP_CIPHER_CTX_new());
     int written = 0, last = 0;
-    const bool ok = ctx && RAND_bytes(nonce, kNonceBytes) == 1 &&
-                    EVP_EncryptInit_ex(ctx.get(), EVP_aes_128_gcm(), nullptr, m_key, nonce) == 1 &&
-                    EVP_EncryptUpdate(ctx.get(), cipher, &written, plain.bytes.data(), static_cast<int>(plain.bytes.size())) == 1 &&
-                    EVP_EncryptFinal_ex(ctx.get(), cipher + written, &last) == 1 &&
-                    EVP_CIPHER_CTX_ctrl(ctx.get(), EVP_CTRL_GCM_GET_TAG, kTagBytes, tag) == 1;
+    const bool ok =
+        ctx && RAND_bytes(nonce, kNonceBytes) == 1 &&
+        EVP_EncryptInit_ex(ctx.get(), EVP_aes_128_gcm(), nullptr, m_key, nonce) == 1 &&
+        EVP_EncryptUpdate(ctx.get(), cipher, &written, plain.bytes.data(), static_cast<int>(plain.bytes.size())) == 1 &&
+        EVP_EncryptFinal_ex(ctx.get(), cipher + written, &last) == 1 &&
+        EVP_CIPHER_CTX_ctrl(ctx.get(), EVP_CTRL_GCM_GET_TAG, kTagBytes, tag) == 1;
     if (!ok) return false;
 
     static constexpr char16_t kHex[] = u"0123456789ABCDEF";
@@ -123,8 +124,8 @@ bool CAesCrypt::DecryptHexString(CString& text) const {
                     EVP_DecryptFinal_ex(ctx.get(), plain.bytes.data() + written, &last) == 1;
     SecureClearString(text);
     if (!ok) return false;
-    std::u16string decoded = Utf8ToUtf16(std::string_view(reinterpret_cast<const char*>(plain.bytes.data()),
-                                                          static_cast<size_t>(written + last)));
+    std::u16string decoded = Utf8ToUtf16(
+        std::string_view(reinterpret_cast<const char*>(plain.bytes.data()), static_cast<size_t>(written + last)));
     text = CString(std::move(decoded));
     return true;
 }

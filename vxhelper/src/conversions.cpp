@@ -35,8 +35,10 @@ bool ValueOf(const VARIANT* value, VARIANT& out, int depth = 0) {
     case VT_UI1: out.bVal = *value->pbVal; return true;
     case VT_I2: out.iVal = *value->piVal; return true;
     case VT_UI2: out.uiVal = *value->puiVal; return true;
-    case VT_I4: case VT_INT: out.lVal = *value->plVal; return true;
-    case VT_UI4: case VT_UINT: out.ulVal = *value->pulVal; return true;
+    case VT_I4:
+    case VT_INT: out.lVal = *value->plVal; return true;
+    case VT_UI4:
+    case VT_UINT: out.ulVal = *value->pulVal; return true;
     case VT_I8: out.llVal = *value->pllVal; return true;
     case VT_UI8: out.ullVal = *value->pullVal; return true;
     case VT_R4: out.fltVal = *value->pfltVal; return true;
@@ -60,7 +62,8 @@ std::u16string Shortest(T number) {
 
 std::u16string CurrencyText(std::int64_t units) {
     const bool negative = units < 0;
-    const std::uint64_t magnitude = negative ? 0 - static_cast<std::uint64_t>(units) : static_cast<std::uint64_t>(units);
+    const std::uint64_t magnitude = negative ? 0 - static_cast<std::uint64_t>(units)
+                                             : static_cast<std::uint64_t>(units);
     std::u16string text = Ascii(std::to_string(magnitude / 10000));
     std::string fraction = std::to_string(magnitude % 10000);
     fraction.insert(0, 4 - fraction.size(), '0');
@@ -78,7 +81,8 @@ bool ParseNumber(BSTR text, double& number) {
     std::string_view s(utf8.data() + first, last - first + 1);
     if (s.front() == '+') s.remove_prefix(1);
     const size_t digitAt = !s.empty() && s.front() == '-' ? 1 : 0;
-    if (digitAt >= s.size() || !(std::isdigit(static_cast<unsigned char>(s[digitAt])) || s[digitAt] == '.')) return false;
+    if (digitAt >= s.size() || !(std::isdigit(static_cast<unsigned char>(s[digitAt])) || s[digitAt] == '.'))
+        return false;
     const auto result = std::from_chars(s.data(), s.data() + s.size(), number);
     return result.ec == std::errc() && result.ptr == s.data() + s.size();
 }
@@ -120,8 +124,10 @@ CString _c_funktionVariantToCString(const VARIANT* value) {
     case VT_UI1: return CString::Formatted(u"%u", v.bVal);
     case VT_I2: return CString::Formatted(u"%d", v.iVal);
     case VT_UI2: return CString::Formatted(u"%u", v.uiVal);
-    case VT_I4: case VT_INT: return CString::Formatted(u"%d", v.lVal);
-    case VT_UI4: case VT_UINT: return CString::Formatted(u"%u", v.ulVal);
+    case VT_I4:
+    case VT_INT: return CString::Formatted(u"%d", v.lVal);
+    case VT_UI4:
+    case VT_UINT: return CString::Formatted(u"%u", v.ulVal);
     case VT_I8: return CString(Ascii(std::to_string(v.llVal)));
     case VT_UI8: return CString(Ascii(std::to_string(v.ullVal)));
     case VT_R4: return CString(Shortest(v.fltVal));
@@ -148,8 +154,10 @@ double _c_funktionVariantToDoubleEx(const VARIANT* value, bool& ok) {
     case VT_UI1: number = v.bVal; break;
     case VT_I2: number = v.iVal; break;
     case VT_UI2: number = v.uiVal; break;
-    case VT_I4: case VT_INT: number = v.lVal; break;
-    case VT_UI4: case VT_UINT: number = v.ulVal; break;
+    case VT_I4:
+    case VT_INT: number = v.lVal; break;
+    case VT_UI4:
+    case VT_UINT: number = v.ulVal; break;
     case VT_I8: number = static_cast<double>(v.llVal); break;
     case VT_UI8: number = static_cast<double>(v.ullVal); break;
     case VT_R4: number = v.fltVal; break;

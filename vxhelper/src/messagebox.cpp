@@ -38,7 +38,8 @@ bool CanShowWidgets() {
 // The answer a box gives when nobody can be asked: the harmless one.
 int DefaultAnswer(UINT buttons) {
     switch (buttons) {
-    case MB_OKCANCEL: case MB_YESNOCANCEL: return IDCANCEL;
+    case MB_OKCANCEL:
+    case MB_YESNOCANCEL: return IDCANCEL;
     case MB_YESNO: return IDNO;
     default: return IDOK;
     }

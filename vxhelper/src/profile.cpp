@@ -4,7 +4,6 @@
 
 #include "vxhelper/IniDocument.h"
 
-
 #include <algorithm>
 #include <atomic>
 #include <cerrno>
@@ -33,7 +32,7 @@ struct ProfileFile {
     int sessions = 0;
 };
 
-std::mutex g_lock;                            // guards g_sessions; serialises every read-modify-write
+std::mutex g_lock;                              // guards g_sessions; serialises every read-modify-write
 std::map<std::string, ProfileFile> g_sessions;  // path -> file held by open sessions
 
 std::string PathOf(LPCWSTR path) { return path ? Utf16ToUtf8(path) : std::string(); }
@@ -177,7 +176,8 @@ DWORD VX_GetPrivateProfileString(LPCWSTR section, LPCWSTR key, LPCWSTR defaultVa
                                  LPCWSTR path) {
     if (!buffer || size == 0) return 0;
     const auto found = Lookup(section, key, path);
-    const std::u16string_view text = found ? std::u16string_view(*found) : std::u16string_view(defaultValue ? defaultValue : u"");
+    const std::u16string_view text = found ? std::u16string_view(*found)
+                                           : std::u16string_view(defaultValue ? defaultValue : u"");
     size_t n = std::min<size_t>(text.size(), size - 1);
     if (n < text.size() && n > 0 && text[n - 1] >= 0xD800 && text[n - 1] <= 0xDBFF) --n;  // keep pairs whole
     text.copy(buffer, n);

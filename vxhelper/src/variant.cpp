@@ -130,7 +130,8 @@ HRESULT VX_CSafeArray::PutElement(LONG index, const void* value) {
 bool VX_CSafeArray::GetVariant(LONG index, VX_CVariant& value) const {
     value.Clear();
     if (!IsIndexValid(index)) return false;
-    if (m_array->vt == VT_VARIANT) return SUCCEEDED(SafeArrayGetElement(m_array, &index, static_cast<VARIANT*>(&value)));
+    if (m_array->vt == VT_VARIANT)
+        return SUCCEEDED(SafeArrayGetElement(m_array, &index, static_cast<VARIANT*>(&value)));
     // Any other element fits the variant's value slot; the copy takes its own text or reference.
     if (FAILED(SafeArrayGetElement(m_array, &index, &value.llVal))) return false;
     value.vt = m_array->vt;

@@ -13,12 +13,13 @@ public:
     CComPtr() = default;
     CComPtr(std::nullptr_t) {}
     // Takes a reference of its own (AddRef).
-    CComPtr(T* p) : m_p(p) { if (m_p) m_p->AddRef(); }
+    CComPtr(T* p) : m_p(p) {
+        if (m_p) m_p->AddRef();
+    }
     CComPtr(const CComPtr& other) : CComPtr(other.m_p) {}
     CComPtr(CComPtr&& other) noexcept : m_p(std::exchange(other.m_p, nullptr)) {}
     template <typename U>
-        requires std::is_convertible_v<U*, T*>
-    CComPtr(const CComPtr<U>& other) : CComPtr(static_cast<T*>(other.Get())) {}
+    requires std::is_convertible_v<U*, T*> CComPtr(const CComPtr<U>& other) : CComPtr(static_cast<T*>(other.Get())) {}
     ~CComPtr() { Release(); }
 
     CComPtr& operator=(T* p) {

@@ -11,9 +11,18 @@ public:
     CComVariant() { VariantInit(this); }
     CComVariant(const char16_t* text);  // VT_BSTR (null gives an empty text)
     CComVariant(std::u16string_view text);
-    CComVariant(int value) : CComVariant() { vt = VT_I4; lVal = value; }
-    CComVariant(double value) : CComVariant() { vt = VT_R8; dblVal = value; }
-    CComVariant(bool value) : CComVariant() { vt = VT_BOOL; boolVal = value ? VARIANT_TRUE : VARIANT_FALSE; }
+    CComVariant(int value) : CComVariant() {
+        vt = VT_I4;
+        lVal = value;
+    }
+    CComVariant(double value) : CComVariant() {
+        vt = VT_R8;
+        dblVal = value;
+    }
+    CComVariant(bool value) : CComVariant() {
+        vt = VT_BOOL;
+        boolVal = value ? VARIANT_TRUE : VARIANT_FALSE;
+    }
     CComVariant(IDispatch* object);  // VT_DISPATCH, with a reference of its own
     // Deep copy (VariantCopy); a copy that cannot be made leaves the variant empty.
     CComVariant(const VARIANT& other) : CComVariant() { VariantCopy(this, &other); }

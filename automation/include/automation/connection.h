@@ -17,7 +17,10 @@
 #include <thread>
 #include <vector>
 
-constexpr IID IID_IConnectionPointContainer = {0xB196B284, 0xBAB4, 0x101A, {0xB6, 0x9C, 0x00, 0xAA, 0x00, 0x34, 0x1D, 0x07}};
+constexpr IID IID_IConnectionPointContainer = {0xB196B284,
+                                               0xBAB4,
+                                               0x101A,
+                                               {0xB6, 0x9C, 0x00, 0xAA, 0x00, 0x34, 0x1D, 0x07}};
 constexpr IID IID_IConnectionPoint = {0xB196B286, 0xBAB4, 0x101A, {0xB6, 0x9C, 0x00, 0xAA, 0x00, 0x34, 0x1D, 0x07}};
 
 class IConnectionPoint;
@@ -81,7 +84,7 @@ public:
 private:
     struct Connection {
         DWORD cookie = 0;
-        CComPtr<IDispatch> sink;                // empty once the connection ended
+        CComPtr<IDispatch> sink;               // empty once the connection ended
         std::vector<std::thread::id> callers;  // threads calling the sink right now
     };
 
@@ -96,7 +99,7 @@ private:
     const IID m_events;
     const AdviseGate m_gate;
 
-    mutable std::mutex m_lock;  // guards m_connections, m_nextCookie, m_closed and every Connection's fields
+    mutable std::mutex m_lock;            // guards m_connections, m_nextCookie, m_closed and every Connection's fields
     std::condition_variable m_callEnded;  // signalled under m_lock when a sink call returns
     std::vector<std::shared_ptr<Connection>> m_connections;
     DWORD m_nextCookie = 1;

@@ -54,7 +54,7 @@ UINT SysStringLen(BSTR text);
 
 // One-dimensional safe array with a lower bound and an element type.
 struct SAFEARRAY {
-    VARTYPE vt;             // element type (VT_I4, VT_R8, VT_BSTR, VT_VARIANT, ...)
+    VARTYPE vt;                // element type (VT_I4, VT_R8, VT_BSTR, VT_VARIANT, ...)
     std::uint32_t cbElements;  // bytes per element
     LONG lLbound;
     std::uint32_t cElements;

@@ -301,8 +301,7 @@ bool CChannel::TakeFrame(std::vector<std::uint8_t> frame) {
         m_exports.erase(it);
         return true;
     }
-    default:
-        return false;
+    default: return false;
     }
 }
 
@@ -438,9 +437,8 @@ bool CChannel::Execute(Op op, Reader& r, Writer& reply, std::vector<std::uint64_
         Advised ended;  // released after the lock
         if (SUCCEEDED(*status)) {
             std::lock_guard lock(m_lock);
-            const auto it = std::find_if(m_advised.begin(), m_advised.end(), [&](const Advised& a) {
-                return a.point == point && a.cookie == cookie;
-            });
+            const auto it = std::find_if(m_advised.begin(), m_advised.end(),
+                                         [&](const Advised& a) { return a.point == point && a.cookie == cookie; });
             if (it != m_advised.end()) {
                 ended = std::move(*it);
                 m_advised.erase(it);

@@ -98,7 +98,7 @@ private:
 
     std::mutex m_writeLock;  // guards writing to m_fd: one frame at a time
 
-    mutable std::mutex m_lock;  // guards every member below
+    mutable std::mutex m_lock;              // guards every member below
     std::condition_variable m_replied;      // a reply arrived or the connection broke
     std::condition_variable m_work;         // a call arrived or the connection broke
     std::condition_variable m_threadEnded;  // m_threads went down

@@ -48,7 +48,7 @@ bool CheckFolder(const std::string& folder, bool create, std::string* error) {
         *error = "cannot create the socket folder " + folder + ": " + std::strerror(errno);
         return false;
     }
-    struct stat info{};
+    struct stat info {};
     if (::lstat(folder.c_str(), &info) != 0) {
         *error = "no socket folder " + folder;
         return false;
@@ -98,8 +98,9 @@ public:
             if (!channel) channel = Connect(name);
             if (!channel) return MK_E_UNAVAILABLE;
             std::uint64_t id = 0;
-            const HRESULT hr = channel->Call(automation_wire::Op::Root, [](automation_wire::Writer&, auto&) { return S_OK; },
-                                             [&](HRESULT, automation_wire::Reader& r) { return r.U64(&id); });
+            const HRESULT hr = channel->Call(
+                automation_wire::Op::Root, [](automation_wire::Writer&, auto&) { return S_OK; },
+                [&](HRESULT, automation_wire::Reader& r) { return r.U64(&id); });
             if (SUCCEEDED(hr) && id) {
                 Keep(name, channel);
                 *object = channel->Import(id).Detach();
@@ -149,12 +150,14 @@ private:
         if (fd < 0) return nullptr;
         uid_t uid = 0;
         pid_t pid = 0;
-        if (::connect(fd, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0 || !PeerUser(fd, &uid, &pid)) {
+        if (::connect(fd, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0 ||
+            !PeerUser(fd, &uid, &pid)) {
             ::close(fd);
             return nullptr;
         }
         if (uid != ::geteuid()) {
-            if (m_options.log) m_options.log(path + ": served by another user (uid " + std::to_string(uid) + "), not used");
+            if (m_options.log)
+                m_options.log(path + ": served by another user (uid " + std::to_string(uid) + "), not used");
             ::close(fd);
             return nullptr;
         }
@@ -163,7 +166,7 @@ private:
 
     const LocalSocketOptions m_options;
     std::string m_folder;
-    std::mutex m_lock;  // guards m_channels
+    std::mutex m_lock;                                            // guards m_channels
     std::map<std::string, std::shared_ptr<CChannel>> m_channels;  // one kept connection per class
 };
 
@@ -171,7 +174,8 @@ private:
 
 class CLocalServer {
 public:
-    CLocalServer(CComPtr<IUnknown> object, LocalSocketOptions options) : m_object(std::move(object)), m_options(std::move(options)) {}
+    CLocalServer(CComPtr<IUnknown> object, LocalSocketOptions options)
+        : m_object(std::move(object)), m_options(std::move(options)) {}
     ~CLocalServer() { Stop(); }
 
     bool Listen(const std::string& folder, REFCLSID clsid, std::string* error) {
@@ -208,7 +212,7 @@ public:
             return false;
         }
         ::chmod(m_path.c_str(), 0600);
-        struct stat info{};
+        struct stat info {};
         ::stat(m_path.c_str(), &info);
         m_inode = info.st_ino;
         m_wake = ::eventfd(0, EFD_CLOEXEC);
@@ -228,7 +232,7 @@ public:
             }
             m_thread.join();
         }
-        struct stat info{};
+        struct stat info {};
         if (!m_path.empty() && ::stat(m_path.c_str(), &info) == 0 && info.st_ino == m_inode) ::unlink(m_path.c_str());
         if (m_listen >= 0) ::close(m_listen);
         if (m_wake >= 0) ::close(m_wake);
@@ -266,7 +270,8 @@ private:
             uid_t uid = 0;
             pid_t pid = 0;
             if (!PeerUser(fd, &uid, &pid) || uid != ::geteuid()) {
-                Log("refused a client of another user (uid " + std::to_string(uid) + ", pid " + std::to_string(pid) + ")");
+                Log("refused a client of another user (uid " + std::to_string(uid) + ", pid " + std::to_string(pid) +
+                    ")");
                 ::close(fd);
                 continue;
             }

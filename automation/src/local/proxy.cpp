@@ -77,7 +77,8 @@ HRESULT CDispatchProxy::Invoke(DISPID member, WORD flags, DISPPARAMS* params, VA
             w.U8(result ? 1 : 0);
             w.U32(params->cArgs);
             for (UINT i = 0; i < params->cArgs; ++i) {
-                if (const HRESULT hr = WriteVariant(w, params->rgvarg[i], *m_channel, true, exported); FAILED(hr)) return hr;
+                if (const HRESULT hr = WriteVariant(w, params->rgvarg[i], *m_channel, true, exported); FAILED(hr))
+                    return hr;
             }
             return S_OK;
         },

@@ -25,7 +25,7 @@ private:
     std::atomic<ULONG> m_refs{1};
     const std::shared_ptr<CChannel> m_channel;
     const std::uint64_t m_id;
-    std::mutex m_lock;          // guards m_answered
+    std::mutex m_lock;            // guards m_answered
     std::vector<IID> m_answered;  // interface ids the remote object answered
 };
 

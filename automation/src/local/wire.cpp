@@ -9,10 +9,22 @@ constexpr std::uint32_t kNullText = 0xFFFFFFFFu;
 // Bytes of a value type that crosses as raw bytes; 0 for every other type.
 std::uint32_t FixedSize(VARTYPE vt) {
     switch (vt) {
-    case VT_I1: case VT_UI1: return 1;
-    case VT_I2: case VT_UI2: case VT_BOOL: return 2;
-    case VT_I4: case VT_UI4: case VT_INT: case VT_UINT: case VT_R4: case VT_ERROR: return 4;
-    case VT_I8: case VT_UI8: case VT_R8: case VT_CY: case VT_DATE: return 8;
+    case VT_I1:
+    case VT_UI1: return 1;
+    case VT_I2:
+    case VT_UI2:
+    case VT_BOOL: return 2;
+    case VT_I4:
+    case VT_UI4:
+    case VT_INT:
+    case VT_UINT:
+    case VT_R4:
+    case VT_ERROR: return 4;
+    case VT_I8:
+    case VT_UI8:
+    case VT_R8:
+    case VT_CY:
+    case VT_DATE: return 8;
     default: return 0;
     }
 }
@@ -86,7 +98,8 @@ HRESULT WriteArray(Writer& w, VARTYPE element, const SAFEARRAY* array, IObjectMa
         const void* at = data + static_cast<size_t>(i) * array->cbElements;
         HRESULT hr = S_OK;
         if (element == VT_BSTR) WriteText(w, *static_cast<const BSTR*>(at));
-        else if (IsObject(element)) hr = WriteObject(w, *static_cast<IUnknown* const*>(at), element == VT_DISPATCH, marshal, exported);
+        else if (IsObject(element))
+            hr = WriteObject(w, *static_cast<IUnknown* const*>(at), element == VT_DISPATCH, marshal, exported);
         else hr = WriteVariant(w, *static_cast<const VARIANT*>(at), marshal, false, exported, depth + 1);
         if (FAILED(hr)) return hr;
         if (w.Size() > kMaxFrame + 4u) return E_OUTOFMEMORY;  // stop early: the frame cannot be sent

@@ -25,7 +25,14 @@ constexpr std::uint32_t kMaxElements = 1u << 22;
 constexpr int kMaxDepth = 4;  // variants inside variants (by-reference targets, variant arrays)
 
 enum class Kind : std::uint8_t { Hello = 1, Call = 2, Reply = 3, Release = 4 };
-enum class Op : std::uint8_t { Root = 1, QueryInterface = 2, Invoke = 3, FindConnectionPoint = 4, Advise = 5, Unadvise = 6 };
+enum class Op : std::uint8_t {
+    Root = 1,
+    QueryInterface = 2,
+    Invoke = 3,
+    FindConnectionPoint = 4,
+    Advise = 5,
+    Unadvise = 6
+};
 
 class Writer {
 public:

@@ -59,9 +59,9 @@ extern "C" {
 // environment variables apply) or all given: proxy address ("host:port" or a
 // URL), user ("DOMAIN\user" for NTLM) and password. Null on failure.
 __attribute__((visibility("default"))) corvell::IAzureInstance* CreateAzureInstance(corvell::ILogger* logger,
-                                                                                   const char16_t* proxyAddress,
-                                                                                   const char16_t* proxyUser,
-                                                                                   const char16_t* proxyPassword);
+                                                                                    const char16_t* proxyAddress,
+                                                                                    const char16_t* proxyUser,
+                                                                                    const char16_t* proxyPassword);
 __attribute__((visibility("default"))) void DestroyAzureInstance(corvell::IAzureInstance* instance);
 }
 

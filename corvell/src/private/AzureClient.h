@@ -82,11 +82,10 @@ private:
         std::string reason;  // why it was not accepted, for the records
     };
 
-    Target* FindOrAddTarget(const std::string& connectionText, ConnectionString connection,
-                            const std::string& entity, bool eventHub);
+    Target* FindOrAddTarget(const std::string& connectionText, ConnectionString connection, const std::string& entity,
+                            bool eventHub);
     std::size_t MessageLimit(const Target& target) const;
-    MessageOutcome SendMessage(std::size_t first, std::size_t last,
-                               std::chrono::steady_clock::time_point deadline);
+    MessageOutcome SendMessage(std::size_t first, std::size_t last, std::chrono::steady_clock::time_point deadline);
     const std::string& Token(Target& target, bool renew);
     std::string Describe(const HttpResponse& response) const;
     std::string TargetName() const;

@@ -8,9 +8,25 @@
 namespace corvell::bond {
 
 enum Type : std::uint8_t {
-    kStop = 0, kStopBase = 1, kBool = 2, kUint8 = 3, kUint16 = 4, kUint32 = 5, kUint64 = 6, kFloat = 7,
-    kDouble = 8, kString = 9, kStruct = 10, kList = 11, kSet = 12, kMap = 13, kInt8 = 14, kInt16 = 15,
-    kInt32 = 16, kInt64 = 17, kWString = 18
+    kStop = 0,
+    kStopBase = 1,
+    kBool = 2,
+    kUint8 = 3,
+    kUint16 = 4,
+    kUint32 = 5,
+    kUint64 = 6,
+    kFloat = 7,
+    kDouble = 8,
+    kString = 9,
+    kStruct = 10,
+    kList = 11,
+    kSet = 12,
+    kMap = 13,
+    kInt8 = 14,
+    kInt16 = 15,
+    kInt32 = 16,
+    kInt64 = 17,
+    kWString = 18
 };
 
 // The marshaled form's first bytes: magic 0x4243 and version 1, little-endian.

@@ -12,7 +12,7 @@ struct ProxySettings {
     std::string address;  // "host:port" or a URL; empty: libcurl's environment variables apply
     std::string user;     // "DOMAIN\user" for NTLM
     std::string password;
-    ~ProxySettings();     // wipes the password
+    ~ProxySettings();  // wipes the password
 };
 
 struct TransportSettings {
@@ -22,7 +22,7 @@ struct TransportSettings {
 };
 
 struct HttpResponse {
-    long status = 0;                             // 0: no HTTP answer (see transportError)
+    long status = 0;  // 0: no HTTP answer (see transportError)
     int curlCode = 0;
     bool tlsFailure = false;                     // certificate or handshake refused
     std::string transportError;                  // libcurl's text when status is 0

@@ -24,8 +24,8 @@ struct Row {
     double value = 0;
     std::u16string_view text;
     bool isText = false;
-    std::int64_t time = 0;            // whole seconds since 1970-01-01 UTC
-    std::uint16_t milliseconds = 0;   // 0..999
+    std::int64_t time = 0;           // whole seconds since 1970-01-01 UTC
+    std::uint16_t milliseconds = 0;  // 0..999
     std::uint64_t status = 0;
 };
 

@@ -12,7 +12,10 @@ public:
     int GetSize() const { return static_cast<int>(m_items.size()); }
     int GetCount() const { return GetSize(); }
     bool IsEmpty() const { return m_items.empty(); }
-    int Add(const CString& s) { m_items.push_back(s); return GetSize() - 1; }
+    int Add(const CString& s) {
+        m_items.push_back(s);
+        return GetSize() - 1;
+    }
     const CString& GetAt(int i) const { return m_items.at(static_cast<size_t>(i)); }
     CString& ElementAt(int i) { return m_items.at(static_cast<size_t>(i)); }
     const CString& operator[](int i) const { return GetAt(i); }

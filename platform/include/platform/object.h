@@ -50,7 +50,9 @@ template <typename T, typename TBase = CCmdTarget, typename TPolicy = VX_TContMe
 class VX_KeepRefCmdPtr {
 public:
     VX_KeepRefCmdPtr() = default;
-    VX_KeepRefCmdPtr(T* p) : m_p(p) { if (m_p) TPolicy::AddRef(static_cast<TBase*>(m_p)); }
+    VX_KeepRefCmdPtr(T* p) : m_p(p) {
+        if (m_p) TPolicy::AddRef(static_cast<TBase*>(m_p));
+    }
     VX_KeepRefCmdPtr(const VX_KeepRefCmdPtr& other) : VX_KeepRefCmdPtr(other.m_p) {}
     VX_KeepRefCmdPtr(VX_KeepRefCmdPtr&& other) noexcept : m_p(other.m_p) { other.m_p = nullptr; }
     ~VX_KeepRefCmdPtr() { Reset(); }

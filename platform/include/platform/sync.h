@@ -19,8 +19,14 @@ public:
 class CCriticalSection : public CSyncObject {
 public:
     // A critical section always waits; the time-out is ignored.
-    bool Lock(DWORD = INFINITE) override { m_mutex.lock(); return true; }
-    bool Unlock() override { m_mutex.unlock(); return true; }
+    bool Lock(DWORD = INFINITE) override {
+        m_mutex.lock();
+        return true;
+    }
+    bool Unlock() override {
+        m_mutex.unlock();
+        return true;
+    }
 
 private:
     std::recursive_mutex m_mutex;

@@ -34,10 +34,15 @@ struct FormatArg {
     std::string_view text8;
 
     template <std::integral T>
-        requires(!std::same_as<T, bool> && !std::same_as<T, char16_t> && !std::same_as<T, char>)
-    FormatArg(T v) : bytes(sizeof(T)) {
-        if constexpr (std::is_signed_v<T>) { kind = Kind::Signed; s = v; }
-        else { kind = Kind::Unsigned; u = v; }
+    requires(!std::same_as<T, bool> && !std::same_as<T, char16_t> && !std::same_as<T, char>) FormatArg(T v)
+        : bytes(sizeof(T)) {
+        if constexpr (std::is_signed_v<T>) {
+            kind = Kind::Signed;
+            s = v;
+        } else {
+            kind = Kind::Unsigned;
+            u = v;
+        }
     }
     FormatArg(bool v) : kind(Kind::Signed), bytes(sizeof(int)), s(v ? 1 : 0) {}
     FormatArg(char16_t c) : kind(Kind::Char), bytes(2), u(c) {}
@@ -61,7 +66,8 @@ class CString {
 public:
     CString() = default;
     CString(const char16_t* text) : m_str(text ? text : u"") {}
-    CString(const char16_t* text, int length) : m_str(text ? std::u16string(text, static_cast<size_t>(length > 0 ? length : 0)) : std::u16string()) {}
+    CString(const char16_t* text, int length)
+        : m_str(text ? std::u16string(text, static_cast<size_t>(length > 0 ? length : 0)) : std::u16string()) {}
     CString(char16_t ch, int repeat = 1) : m_str(static_cast<size_t>(repeat > 0 ? repeat : 0), ch) {}
     CString(std::u16string text) : m_str(std::move(text)) {}
     CString(std::u16string_view text) : m_str(text) {}
@@ -133,14 +139,36 @@ public:
     }
     static std::u16string FormatList(const char16_t* format, const FormatArg* args, size_t count);
 
-    CString& operator+=(const CString& other) { m_str += other.m_str; return *this; }
-    CString& operator+=(const char16_t* other) { if (other) m_str += other; return *this; }
-    CString& operator+=(char16_t ch) { m_str += ch; return *this; }
+    CString& operator+=(const CString& other) {
+        m_str += other.m_str;
+        return *this;
+    }
+    CString& operator+=(const char16_t* other) {
+        if (other) m_str += other;
+        return *this;
+    }
+    CString& operator+=(char16_t ch) {
+        m_str += ch;
+        return *this;
+    }
 
-    friend CString operator+(CString a, const CString& b) { a += b; return a; }
-    friend CString operator+(CString a, const char16_t* b) { a += b; return a; }
-    friend CString operator+(const char16_t* a, const CString& b) { CString r(a); r += b; return r; }
-    friend CString operator+(CString a, char16_t b) { a += b; return a; }
+    friend CString operator+(CString a, const CString& b) {
+        a += b;
+        return a;
+    }
+    friend CString operator+(CString a, const char16_t* b) {
+        a += b;
+        return a;
+    }
+    friend CString operator+(const char16_t* a, const CString& b) {
+        CString r(a);
+        r += b;
+        return r;
+    }
+    friend CString operator+(CString a, char16_t b) {
+        a += b;
+        return a;
+    }
 
     friend bool operator==(const CString& a, const CString& b) { return a.m_str == b.m_str; }
     friend bool operator==(const CString& a, const char16_t* b) { return a.Compare(b) == 0; }

@@ -21,8 +21,8 @@ public:
 
     // Creates the hidden window on the calling thread; class, style and
     // geometry are accepted for the record only. Returns false if it exists.
-    bool CreateEx(DWORD exStyle, const char16_t* className, const char16_t* title, DWORD style,
-                  int x = 0, int y = 0, int width = 0, int height = 0, HWND parent = nullptr, UINT id = 0);
+    bool CreateEx(DWORD exStyle, const char16_t* className, const char16_t* title, DWORD style, int x = 0, int y = 0,
+                  int width = 0, int height = 0, HWND parent = nullptr, UINT id = 0);
     bool CreateMessageWindow(const char16_t* title) { return CreateEx(0, u"Static", title, 0); }
     bool DestroyWindow();
 

@@ -23,7 +23,7 @@ enum class GeneratorKind {
 
 struct GeneratorConfig {
     GeneratorKind kind = GeneratorKind::Constant;
-    double periodMs = 1000;  // time between two changes, simulated time
+    double periodMs = 1000;    // time between two changes, simulated time
     double firstChangeMs = 0;  // simulated time of the first change; 0: one period after the start
     DWORD stopMs = 0;          // no changes after this simulated time; 0: never
     double amplitude = 1.0;

@@ -79,8 +79,8 @@ public:
     // Sets a variable's value, status and time stamp and fires the change to
     // every started container of the (active) project that holds the variable.
     // Any VARIANT is taken as the value. False for an unknown project or variable.
-    bool SetValue(const std::u16string& project, const std::u16string& variable, const VARIANT& value,
-                  ULONGLONG status, DATE time);
+    bool SetValue(const std::u16string& project, const std::u16string& variable, const VARIANT& value, ULONGLONG status,
+                  DATE time);
     // As above with the status kept and the current time.
     bool SetValue(const std::u16string& project, const std::u16string& variable, const VARIANT& value);
     // Sets a variable's status (value kept, time now) and fires the change as SetValue does.
@@ -99,9 +99,9 @@ public:
     // Faults, until switched off or ClearFaults.
     void SetRaiseError(ObjectKind object, DISPID member, bool on = true);  // the member raises an error
     void SetRefusedName(const std::u16string& variable, bool on = true);   // containers refuse to add it
-    void SetStartFails(bool on);           // container start returns FALSE
-    void SetAdviseFails(bool on);          // every Advise fails with CONNECT_E_CANNOTCONNECT
-    void SetProjectLookupFails(bool on);   // project lookups give null
+    void SetStartFails(bool on);                                           // container start returns FALSE
+    void SetAdviseFails(bool on);         // every Advise fails with CONNECT_E_CANNOTCONNECT
+    void SetProjectLookupFails(bool on);  // project lookups give null
     void ClearFaults();
 
     // State for checks.

@@ -16,8 +16,8 @@ public:
     static CComPtr<IDispatch> Find();
 
     bool SetValue(const std::u16string& project, const std::u16string& variable, const VARIANT& value);
-    bool SetValue(const std::u16string& project, const std::u16string& variable, const VARIANT& value,
-                  ULONGLONG status, DATE time);
+    bool SetValue(const std::u16string& project, const std::u16string& variable, const VARIANT& value, ULONGLONG status,
+                  DATE time);
     bool SetStatus(const std::u16string& project, const std::u16string& variable, ULONGLONG status);
     bool SetProjectActive(const std::u16string& project, bool active);
     bool FireRawBulkChange(const std::u16string& project, const std::u16string& container,

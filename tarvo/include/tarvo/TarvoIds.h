@@ -13,7 +13,10 @@ constexpr IID IID_IProject = {0x6CA1C1FE, 0x654C, 0x43D7, {0x8C, 0xFB, 0xE7, 0x3
 constexpr IID IID_IOnlineVariable = {0x1C80E850, 0x59F1, 0x4A94, {0xBF, 0x1B, 0x34, 0x91, 0xFB, 0x86, 0xB9, 0x65}};
 // Event interfaces: a sink answers QueryInterface for these with its IDispatch.
 constexpr IID DIID_IProjectEvents = {0x02850339, 0x13B4, 0x4938, {0x8D, 0x8C, 0x09, 0x66, 0x38, 0xEC, 0x58, 0x37}};
-constexpr IID DIID_IOnlineVariableEvents = {0xB461BFC1, 0x4112, 0x440C, {0x8C, 0x8D, 0x14, 0x21, 0xA5, 0xBD, 0x59, 0xF7}};
+constexpr IID DIID_IOnlineVariableEvents = {0xB461BFC1,
+                                            0x4112,
+                                            0x440C,
+                                            {0x8C, 0x8D, 0x14, 0x21, 0xA5, 0xBD, 0x59, 0xF7}};
 
 namespace tarvo::dispid {
 
@@ -38,16 +41,16 @@ constexpr DISPID ContainersCreate = 4;  // method (name): new online variable co
 constexpr DISPID ContainersDelete = 5;  // method (name): BOOL; deletes that container
 
 // Online variable container
-constexpr DISPID ContainerReset = 13;   // method: BOOL; removes every name and stops
-constexpr DISPID ContainerAdd = 5;      // method (variable name): BOOL, FALSE = not added
-constexpr DISPID ContainerRemove = 6;   // method (variable name): BOOL
-constexpr DISPID ContainerStart = 8;    // method: BOOL, nonzero = started, changes follow
-constexpr DISPID ContainerStop = 9;     // method: no result
+constexpr DISPID ContainerReset = 13;  // method: BOOL; removes every name and stops
+constexpr DISPID ContainerAdd = 5;     // method (variable name): BOOL, FALSE = not added
+constexpr DISPID ContainerRemove = 6;  // method (variable name): BOOL
+constexpr DISPID ContainerStart = 8;   // method: BOOL, nonzero = started, changes follow
+constexpr DISPID ContainerStop = 9;    // method: no result
 
 // Events
-constexpr DISPID EventProjectActive = 1;          // project, no arguments
-constexpr DISPID EventProjectInactive = 2;        // project, no arguments
-constexpr DISPID EventVariableBulkChange = 2;     // container, six arguments (see below)
+constexpr DISPID EventProjectActive = 1;       // project, no arguments
+constexpr DISPID EventProjectInactive = 2;     // project, no arguments
+constexpr DISPID EventVariableBulkChange = 2;  // container, six arguments (see below)
 
 // "VariableBulkChange" arguments in their natural order, each a VARIANT passed
 // by reference (VT_VARIANT|VT_BYREF): 1, the number of changes (I4); 2 to 6,

@@ -240,7 +240,9 @@ TEST(AzureCommSend, LibraryRecordsReachTheModuleLog) {
     TempFolder folder;
     const std::string logPath = folder.Path("module.log");
     setenv("BRENNIC_CONFIG",
-           folder.Write("brennic.ini", "[file]\npath = " + logPath + "\n[stderr]\nenabled = no\n[levels]\n0 = 0\n19 = 1\n")
+           folder
+               .Write("brennic.ini",
+                      "[file]\npath = " + logPath + "\n[stderr]\nenabled = no\n[levels]\n0 = 0\n19 = 1\n")
                .c_str(),
            1);
     CMainAccess module;

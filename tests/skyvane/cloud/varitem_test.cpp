@@ -161,7 +161,9 @@ TEST_F(VarItemTest, EverySecondAroundTheChangesAsTheCLibraryConvertsIt) {
             fields.tm_isdst = -1;
             const LONGLONG expected = std::mktime(&fields);
             const bool twice = day == october27_2024 && second / 3600 == 2;
-            if (twice) EXPECT_TRUE(data.m_time == expected || data.m_time == expected + 3600 || data.m_time == expected - 3600) << second;
+            if (twice)
+                EXPECT_TRUE(data.m_time == expected || data.m_time == expected + 3600 || data.m_time == expected - 3600)
+                    << second;
             else ASSERT_EQ(data.m_time, expected) << "second " << second << " of the day";
         }
     }

@@ -65,15 +65,16 @@ TEST_F(ConfigFileTest, DefaultsGapsDuplicatesAndCounts) {
     EXPECT_EQ(config.m_nIntegrityPeriod, 5);  // no section "Azure"
     EXPECT_TRUE(config.m_strProxyUser.IsEmpty());
     EXPECT_EQ(Names(config), (std::vector<CString>{u"", u"A#x", u"B#y"}));  // the gap is an empty name
-    EXPECT_TRUE(config.m_lstConnections.IsEmpty());  // negative COUNT
+    EXPECT_TRUE(config.m_lstConnections.IsEmpty());                         // negative COUNT
 
     config = Read("[VARIABLES]\nCOUNT=3\nNAME_0=A#x\nNAME_1=A#x\nNAME_2=a#X\n[Azure]\nPROXY_PWD=00AAFF\n");
     EXPECT_EQ(Names(config), (std::vector<CString>{u"A#x", u"a#X"}));
     EXPECT_EQ(config.m_strProxyPassword, u"00AAFF");  // moved as stored, never deciphered
 
     // A COUNT of two billion reads up to the highest numbered key present, gaps included.
-    config = Read("[VARIABLES]\nCOUNT=2000000000\nNAME_0=A\nNAME_5=B\nNAME_007=no entry number\n"
-                  "[CONNECTIONS]\ncount=2000000000\nQUEUE_3=q\n");
+    config = Read(
+        "[VARIABLES]\nCOUNT=2000000000\nNAME_0=A\nNAME_5=B\nNAME_007=no entry number\n"
+        "[CONNECTIONS]\ncount=2000000000\nQUEUE_3=q\n");
     EXPECT_EQ(Names(config), (std::vector<CString>{u"", u"A", u"B"}));
     ASSERT_EQ(config.m_lstConnections.GetCount(), 4);
     EXPECT_EQ(config.m_lstConnections.GetTail()->m_strQueue, u"q");

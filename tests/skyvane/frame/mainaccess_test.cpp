@@ -45,8 +45,9 @@ protected:
 
     // Entry 19 as given; entry 0 (the log's own records) as given, off by default.
     void UseLevels(int entry19, int entry0 = 0) {
-        const std::string config = "[file]\npath = " + LogPath() + "\n[stderr]\nenabled = no\n[levels]\n0 = " +
-                                   std::to_string(entry0) + "\n19 = " + std::to_string(entry19) + "\n";
+        const std::string config = "[file]\npath = " + LogPath() +
+                                   "\n[stderr]\nenabled = no\n[levels]\n0 = " + std::to_string(entry0) +
+                                   "\n19 = " + std::to_string(entry19) + "\n";
         setenv("BRENNIC_CONFIG", m_folder.Write("brennic.ini", config).c_str(), 1);
     }
     std::string LogPath() const { return m_folder.Path("module.log"); }
@@ -99,13 +100,13 @@ TEST_F(MainAccessTest, RepeatedInitKeepsOneSinkAndNamesIt) {
     // The first sink stopped when the second came.
     std::vector<std::string> events;
     for (const std::string& line : LogLines())
-        if (line.find("Log st") != std::string::npos || line.find("once") != std::string::npos) events.push_back(Tail(line));
-    const std::vector<std::string> expected = {
-        "Log INFO kind=1 field=1: Log started for 'skyvane_frame_tests'",
-        "Log INFO kind=1 field=1: Log stopped for 'skyvane_frame_tests'",
-        "Log INFO kind=1 field=1: Log started for 'gateway'",
-        "PelgradDll ERROR kind=76 field=39: once",
-        "Log INFO kind=1 field=1: Log stopped for 'gateway'"};
+        if (line.find("Log st") != std::string::npos || line.find("once") != std::string::npos)
+            events.push_back(Tail(line));
+    const std::vector<std::string> expected = {"Log INFO kind=1 field=1: Log started for 'skyvane_frame_tests'",
+                                               "Log INFO kind=1 field=1: Log stopped for 'skyvane_frame_tests'",
+                                               "Log INFO kind=1 field=1: Log started for 'gateway'",
+                                               "PelgradDll ERROR kind=76 field=39: once",
+                                               "Log INFO kind=1 field=1: Log stopped for 'gateway'"};
     EXPECT_EQ(events, expected);
 }
 
@@ -152,8 +153,12 @@ TEST_F(MainAccessTest, Entry19SelectsErrorsOrInformation) {
         bool infoEnabled;
         std::vector<std::string> lines;
     } cases[] = {
-        {LOG_LEVEL_ERROR, false, {"PelgradDll ERROR kind=76 field=39: error text", "PelgradDll ERROR kind=76 field=39: "}},
-        {LOG_LEVEL_INFO, true, {"PelgradDll INFO kind=76 field=49: info text", "PelgradDll INFO kind=76 field=49: wide info"}},
+        {LOG_LEVEL_ERROR,
+         false,
+         {"PelgradDll ERROR kind=76 field=39: error text", "PelgradDll ERROR kind=76 field=39: "}},
+        {LOG_LEVEL_INFO,
+         true,
+         {"PelgradDll INFO kind=76 field=49: info text", "PelgradDll INFO kind=76 field=49: wide info"}},
     };
     for (const auto& c : cases) {
         SCOPED_TRACE(c.entry19);

@@ -36,8 +36,8 @@ void CRecordingHostWnd::Clear() {
 
 void WriteSettingsFile(const std::string& path, const ModuleSettings& settings) {
     std::ofstream file(path, std::ios::binary | std::ios::trunc);
-    file << "[Azure]\nINTEGRITYPERIOD=" << settings.integrityPeriod << "\n\n[VARIABLES]\nCOUNT="
-         << settings.variables.size() << "\n";
+    file << "[Azure]\nINTEGRITYPERIOD=" << settings.integrityPeriod
+         << "\n\n[VARIABLES]\nCOUNT=" << settings.variables.size() << "\n";
     for (size_t i = 0; i < settings.variables.size(); ++i) file << "NAME_" << i << "=" << settings.variables[i] << "\n";
     file << "\n[CONNECTIONS]\nCOUNT=" << settings.targets.size() << "\n";
     for (size_t i = 0; i < settings.targets.size(); ++i) {
@@ -89,8 +89,8 @@ void CMessageBoxRecorder::Observe(HWND, const CString& text, UINT, void* self) {
 }
 
 CTestLog::CTestLog(const TempFolder& folder) : m_path(folder.Path("module.log")) {
-    const std::string config = folder.Write("brennic.ini", "[levels]\n19 = 129\n[file]\npath = " + m_path +
-                                                              "\n[stderr]\nenabled = no\n");
+    const std::string config =
+        folder.Write("brennic.ini", "[levels]\n19 = 129\n[file]\npath = " + m_path + "\n[stderr]\nenabled = no\n");
     setenv("BRENNIC_CONFIG", config.c_str(), 1);
 }
 
@@ -140,13 +140,15 @@ CBulkPlant::CBulkPlant(int variables) {
 
 bool CBulkPlant::FireRound(double value) {
     const std::vector<double> values(ids.size(), value), zeros(ids.size(), 0.0), times(ids.size(), 45000.25);
-    return runtime->FireRawBulkChange(u"Plant", u"", {CComVariant(static_cast<int>(ids.size())), ArrayOf(VT_R8, 0, ids),
-                                                      ArrayOf(VT_VARIANT, 0, values), ArrayOf(VT_R8, 0, zeros),
-                                                      ArrayOf(VT_R8, 0, zeros), ArrayOf(VT_R8, 0, times)});
+    return runtime->FireRawBulkChange(u"Plant", u"",
+                                      {CComVariant(static_cast<int>(ids.size())), ArrayOf(VT_R8, 0, ids),
+                                       ArrayOf(VT_VARIANT, 0, values), ArrayOf(VT_R8, 0, zeros),
+                                       ArrayOf(VT_R8, 0, zeros), ArrayOf(VT_R8, 0, times)});
 }
 
 std::vector<std::string> CBulkPlant::Keys() const {
     std::vector<std::string> keys;
-    for (size_t i = 0; i < ids.size(); ++i) keys.push_back("Plant#" + CString(VariableName(static_cast<int>(i))).ToUtf8());
+    for (size_t i = 0; i < ids.size(); ++i)
+        keys.push_back("Plant#" + CString(VariableName(static_cast<int>(i))).ToUtf8());
     return keys;
 }

@@ -18,14 +18,16 @@ using azurelocal::AzureLocalProcess;
 void PumpUntilQuiet(const CRecordingHostWnd& host) {
     int seen = -1;
     auto quietSince = std::chrono::steady_clock::now();
-    PumpUntil([&] {
-        const int now = host.Count(WM_USER + 2);
-        if (now != seen) {
-            seen = now;
-            quietSince = std::chrono::steady_clock::now();
-        }
-        return std::chrono::steady_clock::now() - quietSince > std::chrono::seconds(1);
-    }, std::chrono::seconds(120));
+    PumpUntil(
+        [&] {
+            const int now = host.Count(WM_USER + 2);
+            if (now != seen) {
+                seen = now;
+                quietSince = std::chrono::steady_clock::now();
+            }
+            return std::chrono::steady_clock::now() - quietSince > std::chrono::seconds(1);
+        },
+        std::chrono::seconds(120));
 }
 
 TEST(ModuleLoad, EveryChangeOfTenThousandVariablesIsReceivedOrReportedDropped) {
@@ -79,7 +81,9 @@ TEST(ModuleLoad, WithoutTheAzureClientTheQueueHoldsItsLimitPlusOne) {
     std::filesystem::copy_file(azurelocal::BuildBinaryDir() + "/libSkyvane.so", copy);
     CBulkPlant plant(10);  // queue limit 40
     ASSERT_TRUE(plant.started);
-    WriteSettingsFile(folder.Path("skyvane.ini"), {plant.Keys(), {{"Endpoint=sb://127.0.0.1:9/;SharedAccessKeyName=k;SharedAccessKey=s", "values", false, 1}}});
+    WriteSettingsFile(folder.Path("skyvane.ini"),
+                      {plant.Keys(),
+                       {{"Endpoint=sb://127.0.0.1:9/;SharedAccessKeyName=k;SharedAccessKey=s", "values", false, 1}}});
     {
         CHostedModule hosted(folder.Path("skyvane.ini"), copy);
         ASSERT_TRUE(hosted.module.Loaded());

@@ -99,7 +99,8 @@ TEST_F(ModuleTest, ValuesReachEveryTargetInItsFormatOnlyWhenTheyChange) {
 
     Set(u"Plant", u"Level", 12.5);
     for (const char* entity : {"values", "hub", "xml"}) ASSERT_TRUE(WaitForRows(entity, 1)) << entity;
-    for (const auto& [entity, format] : std::map<std::string, std::string>{{"values", "JSON"}, {"hub", "BOND"}, {"xml", "XML"}}) {
+    for (const auto& [entity, format] :
+         std::map<std::string, std::string>{{"values", "JSON"}, {"hub", "BOND"}, {"xml", "XML"}}) {
         const auto rows = RowsOf(entity);
         ASSERT_EQ(rows.size(), 1u) << entity;
         EXPECT_EQ(rows[0].format, format);
@@ -141,7 +142,8 @@ TEST_F(ModuleTest, IntegrityPeriodResendsEveryValidVariable) {
     for (size_t sends = 1; sends <= 2; ++sends) {
         ticks.Advance(sends == 1 ? 1 : 1000);
         ASSERT_TRUE(WaitForRows("values", 1 + sends, "Level")) << sends;
-        ASSERT_TRUE(cycleWithChange(1.0 + static_cast<double>(sends), 1 + 2 * sends)) << "Other: a change and a full set";
+        ASSERT_TRUE(cycleWithChange(1.0 + static_cast<double>(sends), 1 + 2 * sends))
+            << "Other: a change and a full set";
         EXPECT_EQ(RowsOf("values", "Level").size(), 1 + sends) << "one full set a period, never one a cycle";
     }
     EXPECT_TRUE(RowsOf("values", "Idle").empty()) << "no value, no row";
@@ -264,8 +266,8 @@ TEST_F(ModuleTest, ARetriedSendLosesNothingAndRefusedRowsAreReportedWithTheKeyMa
 
 TEST_F(ModuleTest, EveryTargetGetsTheSameRowsAndTheStatusCountsThemAll) {
     StartRuntime({Project(u"Plant", {u"A", u"B", u"C", u"D"})});
-    WriteSettingsFile(SettingsPath(), {{"Plant#A", "Plant#B", "Plant#C", "Plant#D"},
-                                       {Target("first", 1), Target("second", 0)}});
+    WriteSettingsFile(SettingsPath(),
+                      {{"Plant#A", "Plant#B", "Plant#C", "Plant#D"}, {Target("first", 1), Target("second", 0)}});
     ASSERT_EQ(module.Init(&context), 1);
     // The first send waits a second for its retry; the next three changes
     // queue meanwhile and go out together.
@@ -280,7 +282,8 @@ TEST_F(ModuleTest, EveryTargetGetsTheSameRowsAndTheStatusCountsThemAll) {
     // The cycle's status is posted after its last send.
     EXPECT_TRUE(PumpUntil([&] {
         const auto messages = host.Messages();
-        return std::any_of(messages.begin(), messages.end(), [](const auto& m) { return m.message == kStatus && m.wParam == 6; });
+        return std::any_of(messages.begin(), messages.end(),
+                           [](const auto& m) { return m.message == kStatus && m.wParam == 6; });
     }));
 }
 

@@ -152,7 +152,9 @@ public:
                   DATE time) override {
         return Target().SetValue(p, v, value, status, time);
     }
-    bool SetProjectActive(const std::u16string& p, bool active) override { return Target().SetProjectActive(p, active); }
+    bool SetProjectActive(const std::u16string& p, bool active) override {
+        return Target().SetProjectActive(p, active);
+    }
     bool FireRawBulkChange(const std::u16string& p, const std::u16string& c, const std::vector<CComVariant>& args,
                            bool byReference) override {
         return Target().FireRawBulkChange(p, c, args, byReference);
@@ -232,7 +234,8 @@ public:
         }
         m_control = std::make_unique<tarvo::RemoteControl>(tarvo::RemoteControl::Find());
         if (m_control->SetDelivery(Delivery::CallerThread)) return true;
-        ADD_FAILURE() << "no control object: status " << std::hex << m_control->LastStatus() << "; " << m_process.Output();
+        ADD_FAILURE() << "no control object: status " << std::hex << m_control->LastStatus() << "; "
+                      << m_process.Output();
         return false;
     }
     void Kill() {
@@ -288,7 +291,9 @@ protected:
         runtime.reset();
     }
 
-    void MakeManager(DWORD timeoutMs = 2000) { manager = VX_CreateCounted<CMultipleOnlVarsPerPrj>(&target, CString(), timeoutMs); }
+    void MakeManager(DWORD timeoutMs = 2000) {
+        manager = VX_CreateCounted<CMultipleOnlVarsPerPrj>(&target, CString(), timeoutMs);
+    }
 
     // Subscribes keys; returns how many were accepted. Refused cells are deleted here.
     int Subscribe(std::initializer_list<const char16_t*> keys) {
@@ -301,7 +306,9 @@ protected:
         return accepted;
     }
 
-    LONG Id(const char16_t* project, const char16_t* variable) { return runtime->VariableId(project, variable).value_or(-1); }
+    LONG Id(const char16_t* project, const char16_t* variable) {
+        return runtime->VariableId(project, variable).value_or(-1);
+    }
 
     CXOnlVarsPerProject* Project(const char16_t* name) {
         auto it = manager->Projects().find(name);
@@ -317,9 +324,10 @@ protected:
             highs.push_back(1.0);
             times.push_back(45000.5);
         }
-        ASSERT_TRUE(runtime->FireRawBulkChange(project, u"", {CComVariant(static_cast<int>(ids.size())), ArrayOf(VT_R8, 0, ids),
-                                                           ArrayOf(VT_VARIANT, 0, values), ArrayOf(VT_R8, 0, lows),
-                                                           ArrayOf(VT_R8, 0, highs), ArrayOf(VT_R8, 0, times)}));
+        ASSERT_TRUE(runtime->FireRawBulkChange(project, u"",
+                                               {CComVariant(static_cast<int>(ids.size())), ArrayOf(VT_R8, 0, ids),
+                                                ArrayOf(VT_VARIANT, 0, values), ArrayOf(VT_R8, 0, lows),
+                                                ArrayOf(VT_R8, 0, highs), ArrayOf(VT_R8, 0, times)}));
     }
 
     RecordingTarget target;
@@ -330,7 +338,9 @@ protected:
 }  // namespace
 
 INSTANTIATE_TEST_SUITE_P(Transports, RuntimeLink, ::testing::Values(Transport::InProcess, Transport::LocalSocket),
-                         [](const auto& info) { return info.param == Transport::InProcess ? "InProcess" : "LocalSocket"; });
+                         [](const auto& info) {
+                             return info.param == Transport::InProcess ? "InProcess" : "LocalSocket";
+                         });
 
 TEST(VariableKey, SplitsAtTheFirstHash) {
     CString project, variable;
@@ -476,7 +486,8 @@ TEST_P(RuntimeLink, DeactivationDiscardsAndStopsThenActivationResubscribes) {
 
     ASSERT_TRUE(runtime->SetProjectActive(u"Plant", false));  // its handler waits for our tick
     const ULONGLONG end = GetTickCount64() + 3000;
-    while (Project(u"Plant")->GetPendingCommand() != CXOnlVarsPerProject::kDeactivate && GetTickCount64() < end) Sleep(1);
+    while (Project(u"Plant")->GetPendingCommand() != CXOnlVarsPerProject::kDeactivate && GetTickCount64() < end)
+        Sleep(1);
     manager->ProcessPending();
     runtime->Flush();
     ASSERT_EQ(target.deactivated.size(), 1u);
@@ -544,11 +555,13 @@ TEST_P(RuntimeLink, MalformedBulkArraysAreReadSafely) {
     const CComVariant count(2);
 
     // Lower bound 1 everywhere: rebased, both delivered.
-    runtime->FireRawBulkChange(u"Plant", u"", {count, ArrayOf(VT_R8, 1, {level, flow}), ArrayOf(VT_VARIANT, 1, {5, 6}),
-                                               ArrayOf(VT_R8, 1, {0, 0}), ArrayOf(VT_R8, 1, {0, 0}), ArrayOf(VT_R8, 1, {1, 1})});
+    runtime->FireRawBulkChange(u"Plant", u"",
+                               {count, ArrayOf(VT_R8, 1, {level, flow}), ArrayOf(VT_VARIANT, 1, {5, 6}),
+                                ArrayOf(VT_R8, 1, {0, 0}), ArrayOf(VT_R8, 1, {0, 0}), ArrayOf(VT_R8, 1, {1, 1})});
     // Value and time arrays shorter than the ids: only the first element is whole.
-    runtime->FireRawBulkChange(u"Plant", u"", {count, ArrayOf(VT_R8, 0, {level, flow}), ArrayOf(VT_VARIANT, 0, {7}),
-                                               ArrayOf(VT_R8, 0, {0, 0}), ArrayOf(VT_R8, 0, {0, 0}), ArrayOf(VT_R8, 0, {1})});
+    runtime->FireRawBulkChange(u"Plant", u"",
+                               {count, ArrayOf(VT_R8, 0, {level, flow}), ArrayOf(VT_VARIANT, 0, {7}),
+                                ArrayOf(VT_R8, 0, {0, 0}), ArrayOf(VT_R8, 0, {0, 0}), ArrayOf(VT_R8, 0, {1})});
     // Wrong element types, texts for ids, empty arguments, too few arguments.
     CComVariant textIds;
     {
@@ -560,14 +573,18 @@ TEST_P(RuntimeLink, MalformedBulkArraysAreReadSafely) {
         textIds.vt = VT_ARRAY | VT_BSTR;
         textIds.parray = texts;
     }
-    runtime->FireRawBulkChange(u"Plant", u"", {count, textIds, ArrayOf(VT_VARIANT, 0, {1}), ArrayOf(VT_R8, 0, {0}),
-                                               ArrayOf(VT_R8, 0, {0}), ArrayOf(VT_R8, 0, {0})});
-    runtime->FireRawBulkChange(u"Plant", u"", {count, CComVariant(), CComVariant(), CComVariant(), CComVariant(), CComVariant()});
+    runtime->FireRawBulkChange(u"Plant", u"",
+                               {count, textIds, ArrayOf(VT_VARIANT, 0, {1}), ArrayOf(VT_R8, 0, {0}),
+                                ArrayOf(VT_R8, 0, {0}), ArrayOf(VT_R8, 0, {0})});
+    runtime->FireRawBulkChange(u"Plant", u"",
+                               {count, CComVariant(), CComVariant(), CComVariant(), CComVariant(), CComVariant()});
     runtime->FireRawBulkChange(u"Plant", u"", {count, ArrayOf(VT_R8, 0, {level})});
     runtime->FireRawBulkChange(u"Plant", u"", {});
     // Values as a plain number array rather than variants: still read.
-    runtime->FireRawBulkChange(u"Plant", u"", {count, ArrayOf(VT_R8, 0, {flow}), ArrayOf(VT_R8, 0, {9}), ArrayOf(VT_R8, 0, {0}),
-                                               ArrayOf(VT_R8, 0, {0}), ArrayOf(VT_R8, 0, {0})}, false);
+    runtime->FireRawBulkChange(u"Plant", u"",
+                               {count, ArrayOf(VT_R8, 0, {flow}), ArrayOf(VT_R8, 0, {9}), ArrayOf(VT_R8, 0, {0}),
+                                ArrayOf(VT_R8, 0, {0}), ArrayOf(VT_R8, 0, {0})},
+                               false);
 
     manager->ProcessPending();
     ASSERT_EQ(target.changes.size(), 4u);
@@ -649,9 +666,10 @@ TEST_P(RuntimeLink, ValuesPassedByReferenceAreQueuedAsValues) {
     CComVariant valuesArg;
     valuesArg.vt = VT_ARRAY | VT_VARIANT;
     valuesArg.parray = values;
-    ASSERT_TRUE(runtime->FireRawBulkChange(u"Plant", u"", {CComVariant(1), ArrayOf(VT_R8, 0, {double(Id(u"Plant", u"Level"))}),
-                                                       valuesArg, ArrayOf(VT_R8, 0, {0}), ArrayOf(VT_R8, 0, {0}),
-                                                       ArrayOf(VT_R8, 0, {0})}));
+    ASSERT_TRUE(
+        runtime->FireRawBulkChange(u"Plant", u"",
+                                   {CComVariant(1), ArrayOf(VT_R8, 0, {double(Id(u"Plant", u"Level"))}), valuesArg,
+                                    ArrayOf(VT_R8, 0, {0}), ArrayOf(VT_R8, 0, {0}), ArrayOf(VT_R8, 0, {0})}));
     live = -1;  // gone or changed once the event has returned
     manager->ProcessPending();
     ASSERT_EQ(target.changes.size(), 1u);

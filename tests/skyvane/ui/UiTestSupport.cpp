@@ -23,7 +23,8 @@ bool CModalDriver::eventFilter(QObject* watched, QEvent* event) {
     if (event->type() != QEvent::Show) return false;
     if (auto* box = qobject_cast<QMessageBox*>(watched)) {
         m_boxTexts.push_back(box->text().toStdString());
-        QMetaObject::invokeMethod(box, [box] { box->done(QMessageBox::Ok); }, Qt::QueuedConnection);
+        QMetaObject::invokeMethod(
+            box, [box] { box->done(QMessageBox::Ok); }, Qt::QueuedConnection);
         return false;
     }
     auto* dialog = qobject_cast<QDialog*>(watched);
@@ -35,7 +36,11 @@ bool CModalDriver::eventFilter(QObject* watched, QEvent* event) {
         m_pending.erase(it);
         QPointer<QDialog> guarded(dialog);
         QMetaObject::invokeMethod(
-            dialog, [guarded, action] { if (guarded) action(*guarded); }, Qt::QueuedConnection);
+            dialog,
+            [guarded, action] {
+                if (guarded) action(*guarded);
+            },
+            Qt::QueuedConnection);
         break;
     }
     return false;

@@ -25,7 +25,8 @@ namespace {
 
 std::vector<std::string> Texts(QTreeWidget* list, int column = 0) {
     std::vector<std::string> texts;
-    for (int i = 0; i < list->topLevelItemCount(); ++i) texts.push_back(list->topLevelItem(i)->text(column).toStdString());
+    for (int i = 0; i < list->topLevelItemCount(); ++i)
+        texts.push_back(list->topLevelItem(i)->text(column).toStdString());
     return texts;
 }
 
@@ -72,11 +73,11 @@ std::vector<std::string> DrawnArrow(CSortHeaderCtrl* header) {
         std::string row;
         for (int x = changed.left(); x <= changed.right(); ++x) {
             const QRgb pixel = with.pixel(x, y);
-            row += pixel == without.pixel(x, y)      ? '.'
+            row += pixel == without.pixel(x, y)   ? '.'
                    : pixel == qRgb(128, 128, 128) ? 'g'
                    : pixel == qRgb(192, 192, 192) ? 's'
                    : pixel == qRgb(255, 255, 255) ? 'w'
-                                                   : '?';
+                                                  : '?';
         }
         rows.push_back(row);
     }
@@ -147,7 +148,8 @@ TEST_F(SettingsDialogTest, WithoutARuntimeShowsTheSettingsOnlyAndNoMessage) {
     EXPECT_EQ(List(dlg, IDC_LIST_PROJECTS)->topLevelItemCount(), 0);
     EXPECT_EQ(List(dlg, IDC_LIST_VARIABLES)->topLevelItemCount(), 0);
     EXPECT_EQ(Texts(List(dlg, IDC_LIST_EXPORTED)), (std::vector<std::string>{"Line2#Speed", "Plant#Level"}));
-    EXPECT_EQ(Texts(List(dlg, IDC_LIST_CONNECTIONS)), (std::vector<std::string>{"Endpoint=sb://one", "Endpoint=sb://two"}));
+    EXPECT_EQ(Texts(List(dlg, IDC_LIST_CONNECTIONS)),
+              (std::vector<std::string>{"Endpoint=sb://one", "Endpoint=sb://two"}));
     EXPECT_EQ(Texts(List(dlg, IDC_LIST_CONNECTIONS), 1), (std::vector<std::string>{"values", "hub"}));
     EXPECT_EQ(List(dlg, IDC_LIST_CONNECTIONS)->headerItem()->text(1).toStdString(), "Service Bus Queue Name");
     EXPECT_TRUE(driver.BoxTexts().empty());
@@ -243,7 +245,7 @@ TEST(SortHeaderCtrl, ArrowsKeepTheirPatternAndMaskColour) {
     ASSERT_EQ(header->GetImages().size(), 2u);
     const QImage down = header->GetImages()[0].toImage(), up = header->GetImages()[1].toImage();
     ASSERT_EQ(down.size(), QSize(9, 11));
-    EXPECT_EQ(down.pixelColor(0, 0).alpha(), 0);         // mask colour: transparent
+    EXPECT_EQ(down.pixelColor(0, 0).alpha(), 0);  // mask colour: transparent
     EXPECT_EQ(down.pixelColor(0, 2).rgb(), qRgb(128, 128, 128));
     EXPECT_EQ(down.pixelColor(8, 2).rgb(), qRgb(255, 255, 255));
     EXPECT_EQ(down.pixelColor(4, 9).rgb(), qRgb(255, 255, 255));
@@ -339,8 +341,8 @@ TEST_F(SettingsDialogTest, InactiveProjectDisablesTheVariableControlsUntilActive
     CDlgKonfig& dlg = Open();
     QTreeWidget* variables = List(dlg, IDC_LIST_VARIABLES);
     SelectRows(List(dlg, IDC_LIST_PROJECTS), {"Plant"});
-    const std::vector<UINT> ids{IDC_LIST_PROJECTS, IDC_LIST_VARIABLES, IDC_LIST_EXPORTED, IDC_ADD_VARIABLES,
-                                IDC_REMOVE_VARIABLES, IDC_OK};
+    const std::vector<UINT> ids{IDC_LIST_PROJECTS, IDC_LIST_VARIABLES,   IDC_LIST_EXPORTED,
+                                IDC_ADD_VARIABLES, IDC_REMOVE_VARIABLES, IDC_OK};
     auto allEnabled = [&](bool enabled) {
         for (UINT id : ids) {
             if (Control(dlg, id)->isEnabled() != enabled) return false;

@@ -144,31 +144,31 @@ private:
             if (++m_pos >= m_text.size()) return Fail("unterminated escape");
             const char e = m_text[m_pos++];
             switch (e) {
-                case '"': out.push_back('"'); break;
-                case '\\': out.push_back('\\'); break;
-                case '/': out.push_back('/'); break;
-                case 'b': out.push_back('\b'); break;
-                case 'f': out.push_back('\f'); break;
-                case 'n': out.push_back('\n'); break;
-                case 'r': out.push_back('\r'); break;
-                case 't': out.push_back('\t'); break;
-                case 'u': {
-                    char32_t cp = 0;
-                    if (!Hex4(cp)) return false;
-                    if (cp >= 0xD800 && cp <= 0xDBFF) {
-                        char32_t low = 0;
-                        if (m_text.substr(m_pos, 2) != "\\u") return Fail("lone surrogate escape");
-                        m_pos += 2;
-                        if (!Hex4(low)) return false;
-                        if (low < 0xDC00 || low > 0xDFFF) return Fail("lone surrogate escape");
-                        cp = 0x10000 + ((cp - 0xD800) << 10) + (low - 0xDC00);
-                    } else if (cp >= 0xDC00 && cp <= 0xDFFF) {
-                        return Fail("lone surrogate escape");
-                    }
-                    out += QString::fromUcs4(&cp, 1).toStdString();
-                    break;
+            case '"': out.push_back('"'); break;
+            case '\\': out.push_back('\\'); break;
+            case '/': out.push_back('/'); break;
+            case 'b': out.push_back('\b'); break;
+            case 'f': out.push_back('\f'); break;
+            case 'n': out.push_back('\n'); break;
+            case 'r': out.push_back('\r'); break;
+            case 't': out.push_back('\t'); break;
+            case 'u': {
+                char32_t cp = 0;
+                if (!Hex4(cp)) return false;
+                if (cp >= 0xD800 && cp <= 0xDBFF) {
+                    char32_t low = 0;
+                    if (m_text.substr(m_pos, 2) != "\\u") return Fail("lone surrogate escape");
+                    m_pos += 2;
+                    if (!Hex4(low)) return false;
+                    if (low < 0xDC00 || low > 0xDFFF) return Fail("lone surrogate escape");
+                    cp = 0x10000 + ((cp - 0xD800) << 10) + (low - 0xDC00);
+                } else if (cp >= 0xDC00 && cp <= 0xDFFF) {
+                    return Fail("lone surrogate escape");
                 }
-                default: return Fail("unknown escape");
+                out += QString::fromUcs4(&cp, 1).toStdString();
+                break;
+            }
+            default: return Fail("unknown escape");
             }
         }
         ++m_pos;  // closing quote

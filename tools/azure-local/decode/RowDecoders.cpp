@@ -101,7 +101,8 @@ public:
     bool Double(double& out) {
         if (m_data.size() - m_pos < 8) return false;
         std::uint64_t bits = 0;
-        for (int i = 0; i < 8; ++i) bits |= static_cast<std::uint64_t>(static_cast<std::uint8_t>(m_data[m_pos + i])) << (8 * i);
+        for (int i = 0; i < 8; ++i)
+            bits |= static_cast<std::uint64_t>(static_cast<std::uint8_t>(m_data[m_pos + i])) << (8 * i);
         std::memcpy(&out, &bits, sizeof out);
         m_pos += 8;
         return true;
@@ -113,27 +114,35 @@ public:
         std::uint64_t n = 0;
         std::uint8_t b = 0;
         switch (type) {
-            case 2: case 3: case 14: return Byte(b);
-            case 4: case 5: case 6: case 15: case 16: case 17: return Varint(n);
-            case 7: return Advance(4);
-            case 8: return Advance(8);
-            case 9: return Varint(n) && Advance(n);
-            case 18: return Varint(n) && n <= m_data.size() && Advance(n * 2);
-            case 10: return SkipStruct(depth + 1);
-            case 11: case 12: {
-                if (!Byte(b) || !Varint(n)) return false;
-                for (std::uint64_t i = 0; i < n; ++i)
-                    if (!Skip(b & 0x1F, depth + 1)) return false;
-                return true;
-            }
-            case 13: {
-                std::uint8_t k = 0, v = 0;
-                if (!Byte(k) || !Byte(v) || !Varint(n)) return false;
-                for (std::uint64_t i = 0; i < n; ++i)
-                    if (!Skip(k & 0x1F, depth + 1) || !Skip(v & 0x1F, depth + 1)) return false;
-                return true;
-            }
-            default: return false;
+        case 2:
+        case 3:
+        case 14: return Byte(b);
+        case 4:
+        case 5:
+        case 6:
+        case 15:
+        case 16:
+        case 17: return Varint(n);
+        case 7: return Advance(4);
+        case 8: return Advance(8);
+        case 9: return Varint(n) && Advance(n);
+        case 18: return Varint(n) && n <= m_data.size() && Advance(n * 2);
+        case 10: return SkipStruct(depth + 1);
+        case 11:
+        case 12: {
+            if (!Byte(b) || !Varint(n)) return false;
+            for (std::uint64_t i = 0; i < n; ++i)
+                if (!Skip(b & 0x1F, depth + 1)) return false;
+            return true;
+        }
+        case 13: {
+            std::uint8_t k = 0, v = 0;
+            if (!Byte(k) || !Byte(v) || !Varint(n)) return false;
+            for (std::uint64_t i = 0; i < n; ++i)
+                if (!Skip(k & 0x1F, depth + 1) || !Skip(v & 0x1F, depth + 1)) return false;
+            return true;
+        }
+        default: return false;
         }
     }
 
@@ -180,7 +189,8 @@ bool ReadBondRow(BondReader& reader, DecodedRow& row, std::string& error) {
             ok = reader.Varint(n) && n <= 0xFFFF;
             row.milliseconds = static_cast<unsigned>(n);
         } else if (id == 7 && type == 6) ok = reader.Varint(row.status);
-        else if (id <= 7) return error = "field " + std::to_string(id) + " has the wrong type " + std::to_string(type), false;
+        else if (id <= 7)
+            return error = "field " + std::to_string(id) + " has the wrong type " + std::to_string(type), false;
         else ok = reader.Skip(type);
         if (!ok) return error = "malformed field " + std::to_string(id), false;
     }
@@ -198,7 +208,8 @@ std::string Hmac(std::string_view key, std::string_view data) {
 
 std::string Lower(std::string_view text) {
     std::string out(text);
-    std::transform(out.begin(), out.end(), out.begin(), [](unsigned char c) { return static_cast<char>(std::tolower(c)); });
+    std::transform(out.begin(), out.end(), out.begin(),
+                   [](unsigned char c) { return static_cast<char>(std::tolower(c)); });
     return out;
 }
 
@@ -395,8 +406,10 @@ std::optional<DecodedRow> RowFromJsonLine(std::string_view line, std::string* en
         row.value = value->AsDouble().value_or(0);
     }
     // Read exactly: a Bond body carries any 64-bit time, which a double would round.
-    if (const JsonValue* v = document->Find("time"); v && v->kind == JsonValue::Kind::Number) ParseSigned(v->text, row.time);
-    if (const JsonValue* v = document->Find("milliseconds")) row.milliseconds = static_cast<unsigned>(v->AsUnsigned().value_or(0));
+    if (const JsonValue* v = document->Find("time"); v && v->kind == JsonValue::Kind::Number)
+        ParseSigned(v->text, row.time);
+    if (const JsonValue* v = document->Find("milliseconds"))
+        row.milliseconds = static_cast<unsigned>(v->AsUnsigned().value_or(0));
     if (const JsonValue* v = document->Find("status")) row.status = v->AsUnsigned().value_or(0);
     if (entity) *entity = text("entity");
     if (format) *format = text("format");
@@ -436,7 +449,8 @@ bool CheckSasToken(std::string_view authorization, std::string_view keyName, std
         else if (name == "se") se = value;
         else if (name == "skn") skn = value;
     }
-    if (sr.empty() || sig.empty() || se.empty() || skn.empty()) return why = "the token lacks sr, sig, se or skn", false;
+    if (sr.empty() || sig.empty() || se.empty() || skn.empty())
+        return why = "the token lacks sr, sig, se or skn", false;
     if (skn != keyName) return why = "unknown key name", false;
     std::uint64_t expiry = 0;
     if (!ParseUnsigned(se, expiry)) return why = "malformed expiry", false;

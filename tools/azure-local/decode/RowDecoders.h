@@ -17,7 +17,7 @@ struct DecodedRow {
     std::string project;  // UTF-8
     std::string variable;
     bool isText = false;
-    double value = 0;     // NaN when a JSON body held null
+    double value = 0;  // NaN when a JSON body held null
     std::string text;
     std::int64_t time = 0;  // seconds since 1970 UTC
     unsigned milliseconds = 0;

@@ -68,7 +68,8 @@ bool AzureLocalProcess::Spawn(const std::vector<std::string>& arguments, std::st
 bool AzureLocalProcess::ReadFirstLine(std::string& line, int timeoutMs) {
     const auto deadline = std::chrono::steady_clock::now() + std::chrono::milliseconds(timeoutMs);
     while (line.find('\n') == std::string::npos) {
-        const auto left = std::chrono::duration_cast<std::chrono::milliseconds>(deadline - std::chrono::steady_clock::now());
+        const auto left =
+            std::chrono::duration_cast<std::chrono::milliseconds>(deadline - std::chrono::steady_clock::now());
         pollfd wait{m_stdout, POLLIN, 0};
         if (left.count() <= 0 || poll(&wait, 1, static_cast<int>(left.count())) <= 0) return false;
         char buffer[256];
@@ -183,7 +184,8 @@ ServerStats AzureLocalProcess::ReadStats(const std::string& path, long timeoutSe
     stats.unauthorized = Number(*json, "unauthorized");
     stats.tooLarge = Number(*json, "tooLarge");
     stats.latencyRows = Number(*json, "latencyRows");
-    for (auto [name, field] : {std::pair{"latencyP50Ms", &stats.latencyP50Ms}, std::pair{"latencyP99Ms", &stats.latencyP99Ms}}) {
+    for (auto [name, field] :
+         {std::pair{"latencyP50Ms", &stats.latencyP50Ms}, std::pair{"latencyP99Ms", &stats.latencyP99Ms}}) {
         if (const JsonValue* v = json->Find(name)) *field = static_cast<std::int64_t>(v->AsDouble().value_or(-1));
     }
     return stats;
@@ -224,8 +226,8 @@ bool MakeSelfSignedCertificate(const std::string& dir, std::string& certFile, st
         X509V3_CTX ctx;
         X509V3_set_ctx_nodb(&ctx);
         X509V3_set_ctx(&ctx, cert, cert, nullptr, nullptr, 0);
-        for (const auto& [nid, value] : {std::pair{NID_subject_alt_name, "IP:127.0.0.1"},
-                                         std::pair{NID_basic_constraints, "critical,CA:TRUE"}}) {
+        for (const auto& [nid, value] :
+             {std::pair{NID_subject_alt_name, "IP:127.0.0.1"}, std::pair{NID_basic_constraints, "critical,CA:TRUE"}}) {
             X509_EXTENSION* ext = X509V3_EXT_conf_nid(nullptr, &ctx, nid, value);
             ok = ok && ext && X509_add_ext(cert, ext, -1);
             X509_EXTENSION_free(ext);

@@ -25,22 +25,22 @@ constexpr qint64 kMaxBodyBytes = 64 * 1024 * 1024;
 
 QByteArray ReasonPhrase(int status) {
     switch (status) {
-        case 100: return "Continue";
-        case 200: return "OK";
-        case 201: return "Created";
-        case 400: return "Bad Request";
-        case 401: return "Unauthorized";
-        case 403: return "Forbidden";
-        case 404: return "Not Found";
-        case 405: return "Method Not Allowed";
-        case 407: return "Proxy Authentication Required";
-        case 411: return "Length Required";
-        case 413: return "Request Entity Too Large";
-        case 429: return "Too Many Requests";
-        case 431: return "Request Header Fields Too Large";
-        case 500: return "Internal Server Error";
-        case 503: return "Service Unavailable";
-        default: return "Status";
+    case 100: return "Continue";
+    case 200: return "OK";
+    case 201: return "Created";
+    case 400: return "Bad Request";
+    case 401: return "Unauthorized";
+    case 403: return "Forbidden";
+    case 404: return "Not Found";
+    case 405: return "Method Not Allowed";
+    case 407: return "Proxy Authentication Required";
+    case 411: return "Length Required";
+    case 413: return "Request Entity Too Large";
+    case 429: return "Too Many Requests";
+    case 431: return "Request Header Fields Too Large";
+    case 500: return "Internal Server Error";
+    case 503: return "Service Unavailable";
+    default: return "Status";
     }
 }
 
@@ -88,7 +88,8 @@ std::optional<quint64> CountRows(const std::string& formatAnyCase, const QByteAr
     const std::string_view text(body.constData(), static_cast<std::size_t>(body.size()));
     auto occurrences = [&text](std::string_view opening) {
         quint64 count = 0;
-        for (std::size_t at = text.find(opening); at != std::string_view::npos; at = text.find(opening, at + 1)) ++count;
+        for (std::size_t at = text.find(opening); at != std::string_view::npos; at = text.find(opening, at + 1))
+            ++count;
         return count;
     };
     if (format == "JSON" && text.starts_with('[')) return occurrences("{\"project\":");
@@ -109,9 +110,7 @@ constexpr std::size_t kLatencyBuckets = 60001;  // 0 to 60 s by the millisecond,
 }  // namespace
 
 Server::Server(ServerConfig config, QObject* parent)
-    : QObject(parent),
-      m_config(std::move(config)),
-      m_startServiceBusLimit(m_config.serviceBusLimit),
+    : QObject(parent), m_config(std::move(config)), m_startServiceBusLimit(m_config.serviceBusLimit),
       m_startEventHubLimit(m_config.eventHubLimit) {}
 
 bool Server::Start(QString& error) {
@@ -142,10 +141,9 @@ bool Server::Start(QString& error) {
         m_server = new QTcpServer(this);
     }
     if (!m_config.recordPath.isEmpty()) {
-        const bool opened = m_config.recordPath == "-"
-                                ? m_recordFile.open(stdout, QIODevice::WriteOnly)
-                                : (m_recordFile.setFileName(m_config.recordPath),
-                                   m_recordFile.open(QIODevice::WriteOnly | QIODevice::Append));
+        const bool opened = m_config.recordPath == "-" ? m_recordFile.open(stdout, QIODevice::WriteOnly)
+                                                       : (m_recordFile.setFileName(m_config.recordPath),
+                                                          m_recordFile.open(QIODevice::WriteOnly | QIODevice::Append));
         if (!opened) {
             error = "cannot open the record file " + m_config.recordPath;
             return false;
@@ -246,7 +244,8 @@ void Server::Handle(QTcpSocket* socket, const HttpRequest& request) {
         if (!m_config.proxyCredentials.isEmpty() &&
             request.headers.value("proxy-authorization") != "Basic " + m_config.proxyCredentials.toUtf8().toBase64()) {
             HttpReply reply = ErrorReply(407, "proxy credentials required");
-            reply.headers.append(qMakePair(QByteArray("Proxy-Authenticate"), QByteArray("Basic realm=\"azure-local\"")));
+            reply.headers.append(
+                qMakePair(QByteArray("Proxy-Authenticate"), QByteArray("Basic realm=\"azure-local\"")));
             Write(socket, reply, false);
             return;
         }
@@ -275,19 +274,17 @@ void Server::Handle(QTcpSocket* socket, const HttpRequest& request) {
     ++m_counters.requests;
     if (const auto fault = TakeFault(request)) {
         switch (fault->kind) {
-            case Fault::Kind::Stall:
-                m_states[socket].stalled = true;
-                return;
-            case Fault::Kind::Close:
-                m_states.remove(socket);
-                socket->abort();
-                return;
-            case Fault::Kind::Status:
-            case Fault::Kind::EchoAuthorization:
-            case Fault::Kind::EchoSignature:
-                ++m_counters.rejected;
-                Write(socket, FaultReply(*fault, request), false);
-                return;
+        case Fault::Kind::Stall: m_states[socket].stalled = true; return;
+        case Fault::Kind::Close:
+            m_states.remove(socket);
+            socket->abort();
+            return;
+        case Fault::Kind::Status:
+        case Fault::Kind::EchoAuthorization:
+        case Fault::Kind::EchoSignature:
+            ++m_counters.rejected;
+            Write(socket, FaultReply(*fault, request), false);
+            return;
         }
     }
     const HttpReply reply = HandleSend(request, path, query, authority);
@@ -373,7 +370,8 @@ HttpReply Server::HandleSend(const HttpRequest& request, const QByteArray& path,
     }
     std::vector<std::string> lines;
     lines.reserve(decoded.rows.size());
-    for (const DecodedRow& row : decoded.rows) lines.push_back(RowToJsonLine(row, entity.toStdString(), format, messageId));
+    for (const DecodedRow& row : decoded.rows)
+        lines.push_back(RowToJsonLine(row, entity.toStdString(), format, messageId));
     Record(lines);
     NoteLatencies(decoded.rows);
     ++m_counters.messages;
@@ -468,11 +466,11 @@ void Server::Record(const std::vector<std::string>& lines) {
 
 QByteArray Server::StatsBody() const {
     const auto& c = m_counters;
-    QByteArray body = "{\"requests\":" + QByteArray::number(c.requests) + ",\"messages\":" + QByteArray::number(c.messages) +
-                      ",\"rows\":" + QByteArray::number(c.rows) + ",\"rejected\":" + QByteArray::number(c.rejected) +
-                      ",\"bytes\":" + QByteArray::number(c.bytes) + ",\"proxied\":" + QByteArray::number(c.proxied) +
-                      ",\"unauthorized\":" + QByteArray::number(c.unauthorized) +
-                      ",\"tooLarge\":" + QByteArray::number(c.tooLarge);
+    QByteArray body =
+        "{\"requests\":" + QByteArray::number(c.requests) + ",\"messages\":" + QByteArray::number(c.messages) +
+        ",\"rows\":" + QByteArray::number(c.rows) + ",\"rejected\":" + QByteArray::number(c.rejected) +
+        ",\"bytes\":" + QByteArray::number(c.bytes) + ",\"proxied\":" + QByteArray::number(c.proxied) +
+        ",\"unauthorized\":" + QByteArray::number(c.unauthorized) + ",\"tooLarge\":" + QByteArray::number(c.tooLarge);
     // Percentiles of the decoded rows' latency, in whole milliseconds (-1: none decoded).
     quint64 total = 0;
     for (const quint64 n : m_latencyMs) total += n;

@@ -66,9 +66,9 @@ struct Fault {
     QByteArray retryAfter;    // seconds, sent as Retry-After
     QByteArray retryAfterMs;  // sent as retry-after-ms
     int remaining = 1;
-    int skip = 0;             // requests to let through first (at=N: the Nth request from now)
-    QByteArray match;         // applies only to requests whose body holds this text
-    QByteArray detail;        // the error text of a status fault; empty: "injected fault"
+    int skip = 0;       // requests to let through first (at=N: the Nth request from now)
+    QByteArray match;   // applies only to requests whose body holds this text
+    QByteArray detail;  // the error text of a status fault; empty: "injected fault"
 };
 
 class Server : public QObject {
@@ -112,9 +112,9 @@ private:
     QTcpServer* m_server = nullptr;
     QFile m_recordFile;
     std::deque<Fault> m_faults;
-    std::deque<std::string> m_rows;  // the last keepRows rows as JSON lines
+    std::deque<std::string> m_rows;         // the last keepRows rows as JSON lines
     QHash<QTcpSocket*, quint64> m_waiters;  // connections waiting for this many rows
-    std::vector<quint64> m_latencyMs;  // rows by whole milliseconds of latency; the last counts the rest
+    std::vector<quint64> m_latencyMs;       // rows by whole milliseconds of latency; the last counts the rest
     struct Counters {
         quint64 requests = 0, messages = 0, rows = 0, rejected = 0, bytes = 0, proxied = 0, unauthorized = 0,
                 tooLarge = 0;

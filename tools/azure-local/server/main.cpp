@@ -99,9 +99,9 @@ int main(int argc, char** argv) {
     if (parser.isSet("quit-on-eof")) {
         std::thread([&app] {
             char buffer[256];
-            while (std::fread(buffer, 1, sizeof buffer, stdin) > 0) {
-            }
-            QMetaObject::invokeMethod(&app, [] { QCoreApplication::quit(); }, Qt::QueuedConnection);
+            while (std::fread(buffer, 1, sizeof buffer, stdin) > 0) {}
+            QMetaObject::invokeMethod(
+                &app, [] { QCoreApplication::quit(); }, Qt::QueuedConnection);
         }).detach();
     }
     return app.exec();

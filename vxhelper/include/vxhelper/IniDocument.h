@@ -69,22 +69,22 @@ public:
 private:
     enum class Kind { Blank, Other, Section, Key };
     struct Line {
-        std::string raw;          // the line's bytes, line end included
-        std::size_t endBytes = 0; // how many of them are the line end
+        std::string raw;           // the line's bytes, line end included
+        std::size_t endBytes = 0;  // how many of them are the line end
         Kind kind = Kind::Other;
-        std::u16string name;      // section or key name, trimmed
-        std::u16string value;     // a key's value as read
+        std::u16string name;   // section or key name, trimmed
+        std::u16string value;  // a key's value as read
     };
     using LineIt = std::list<Line>::iterator;
     struct Section {
         LineIt header;
-        LineIt lastNonBlank;                               // where new keys go after
+        LineIt lastNonBlank;                              // where new keys go after
         std::unordered_map<std::u16string, LineIt> keys;  // folded key -> first line
     };
 
     void Classify(Line& line) const;
     void BuildIndex();
-    std::size_t UnitBytes() const;                                     // bytes of one character unit
+    std::size_t UnitBytes() const;                                      // bytes of one character unit
     char16_t UnitAt(std::string_view bytes, std::size_t offset) const;  // one character unit
     bool CanEncode(std::u16string_view text) const;
     std::string Encode(std::u16string_view text) const;
@@ -96,8 +96,8 @@ private:
     void RewriteValue(Line& line, std::u16string_view stored);
 
     Encoding m_encoding = Encoding::Utf8;
-    std::string m_bom;              // byte-order mark as found (may be empty)
-    std::string m_newline;          // line end of the first ended line, in file encoding
+    std::string m_bom;      // byte-order mark as found (may be empty)
+    std::string m_newline;  // line end of the first ended line, in file encoding
     std::list<Line> m_lines;
     std::vector<Section> m_sections;
     std::unordered_map<std::u16string, std::size_t> m_sectionIndex;  // folded name -> first section

@@ -48,11 +48,11 @@ public:
 private:
     static void* Trampoline(void* self);
 
-    mutable std::mutex m_lock;          // guards every member below
-    std::condition_variable m_ended;    // signalled when the routine returns
+    mutable std::mutex m_lock;        // guards every member below
+    std::condition_variable m_ended;  // signalled when the routine returns
     pthread_t m_thread{};
-    bool m_joinable = false;            // a thread was created and not yet joined
-    bool m_running = false;             // the routine has not returned yet
+    bool m_joinable = false;  // a thread was created and not yet joined
+    bool m_running = false;   // the routine has not returned yet
     bool m_runFlag = false;
     Routine m_routine = nullptr;
     void* m_parameter = nullptr;

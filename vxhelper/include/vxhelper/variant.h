@@ -50,11 +50,11 @@ public:
     VX_CVariant(const VARIANT& other);
     VX_CVariant(const VX_CVariant& other) : VX_CVariant(static_cast<const VARIANT&>(other)) {}
     VX_CVariant(VX_CVariant&& other) noexcept;
-    explicit VX_CVariant(std::int32_t value);             // VT_I4
-    explicit VX_CVariant(std::int64_t value);             // VT_I8
+    explicit VX_CVariant(std::int32_t value);                  // VT_I4
+    explicit VX_CVariant(std::int64_t value);                  // VT_I8
     explicit VX_CVariant(double value, VARTYPE type = VT_R8);  // VT_R8 or VT_DATE
-    explicit VX_CVariant(bool value);                     // VT_BOOL
-    explicit VX_CVariant(const char16_t* text);           // VT_BSTR (null: empty text)
+    explicit VX_CVariant(bool value);                          // VT_BOOL
+    explicit VX_CVariant(const char16_t* text);                // VT_BSTR (null: empty text)
     explicit VX_CVariant(const CString& text) : VX_CVariant(text.GetString()) {}
     ~VX_CVariant() { VariantClear(this); }
 
