@@ -1,8 +1,8 @@
 #!/usr/bin/env bash
 # Installs what is missing, builds and runs the tests.
-#   bash scripts/test.sh                      what CI runs (.ci/run): every test of the release
-#                                             flavour and the demo, then the concurrency suites
-#                                             under ASan+UBSan and under TSan
+#   bash scripts/test.sh                      what CI runs (.ci/run): the format check, every test
+#                                             of the release flavour and the demo, then the
+#                                             concurrency suites under ASan+UBSan and under TSan
 #   bash scripts/test.sh FLAVOUR              every test of one flavour: release, asan or tsan
 #   bash scripts/test.sh FLAVOUR concurrency  only the concurrency suites, only their targets built
 set -euo pipefail
@@ -12,6 +12,8 @@ scope=${2:-all}
 
 # --- The whole CI run -------------------------------------------------------
 if [[ "$flavour" == ci ]]; then
+  bash "$top/scripts/setup.sh"
+  bash "$top/scripts/format.sh" --check
   bash "$top/scripts/test.sh" release
   bash "$top/scripts/test.sh" asan concurrency
   bash "$top/scripts/test.sh" tsan concurrency
