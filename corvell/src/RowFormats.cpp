@@ -4,6 +4,7 @@
 #include "private/Utf.h"
 
 #include <charconv>
+#include <chrono>
 #include <cmath>
 #include <cstdio>
 #include <cstring>
@@ -67,17 +68,19 @@ void PutUnsigned(std::string& out, std::uint64_t value) {
     out.append(buffer, result.ptr);
 }
 
-// Days since 1970-01-01 to a civil date (proleptic Gregorian).
+// Days since 1970-01-01 to a civil date (proleptic Gregorian). The standard
+// calendar covers the years -32767 to 32767; the Gregorian calendar repeats
+// every 400 years (146,097 days), so whole cycles are set aside first and any
+// 64-bit day count works.
 void CivilFromDays(std::int64_t days, std::int64_t& year, unsigned& month, unsigned& day) {
-    days += 719468;
-    const std::int64_t era = (days >= 0 ? days : days - 146096) / 146097;
-    const auto doe = static_cast<unsigned>(days - era * 146097);
-    const unsigned yoe = (doe - doe / 1460 + doe / 36524 - doe / 146096) / 365;
-    const unsigned doy = doe - (365 * yoe + yoe / 4 - yoe / 100);
-    const unsigned mp = (5 * doy + 2) / 153;
-    day = doy - (153 * mp + 2) / 5 + 1;
-    month = mp < 10 ? mp + 3 : mp - 9;
-    year = static_cast<std::int64_t>(yoe) + era * 400 + (month <= 2 ? 1 : 0);
+    constexpr std::int64_t kDaysPer400Years = 146097;
+    std::int64_t cycles = days / kDaysPer400Years;
+    std::int64_t rest = days % kDaysPer400Years;
+    if (rest < 0) rest += kDaysPer400Years, --cycles;
+    const std::chrono::year_month_day date{std::chrono::sys_days{std::chrono::days{rest}}};
+    year = static_cast<int>(date.year()) + cycles * 400;
+    month = static_cast<unsigned>(date.month());
+    day = static_cast<unsigned>(date.day());
 }
 
 // Fields equal to their default are left out, as Bond writers do; readers

@@ -149,6 +149,9 @@ TEST(IsoTime, CalendarEdges) {
     EXPECT_EQ(FormatIsoTime(4294967295, 0), "2106-02-07T06:28:15.000Z");   // largest 32-bit time
     EXPECT_EQ(FormatIsoTime(-1, 0), "1969-12-31T23:59:59.000Z");
     EXPECT_EQ(FormatIsoTime(253402300800, 5), "10000-01-01T00:00:00.005Z");  // past four digits of year
+    EXPECT_EQ(FormatIsoTime(-62167219200, 0), "0000-01-01T00:00:00.000Z");
+    EXPECT_EQ(FormatIsoTime(-62167219201, 0), "-001-12-31T23:59:59.000Z");
+    EXPECT_EQ(FormatIsoTime(1036799999999, 0), "34824-11-18T23:59:59.000Z");  // beyond the standard calendar's years
 }
 
 // Every UTF-16 text, including lone surrogates and characters XML cannot carry,
