@@ -1,5 +1,6 @@
 #include "automation/dispatch.h"
 #include "automation/variant.h"
+#include "value_size.h"
 
 #include <cstdlib>
 #include <new>
@@ -70,9 +71,7 @@ HRESULT VariantCopy(VARIANT* dest, const VARIANT* src) {
 
 // ---- SAFEARRAY -------------------------------------------------------------
 
-namespace {
-
-std::uint32_t ElementSize(VARTYPE vt) {
+std::uint32_t FixedValueSize(VARTYPE vt) {
     switch (vt) {
     case VT_I1:
     case VT_UI1: return 1;
@@ -90,6 +89,15 @@ std::uint32_t ElementSize(VARTYPE vt) {
     case VT_R8:
     case VT_CY:
     case VT_DATE: return 8;
+    default: return 0;
+    }
+}
+
+namespace {
+
+std::uint32_t ElementSize(VARTYPE vt) {
+    if (const std::uint32_t size = FixedValueSize(vt)) return size;
+    switch (vt) {
     case VT_BSTR: return sizeof(BSTR);
     case VT_DISPATCH:
     case VT_UNKNOWN: return sizeof(IUnknown*);

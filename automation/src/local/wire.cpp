@@ -1,4 +1,5 @@
 #include "local/wire.h"
+#include "value_size.h"
 
 namespace automation_wire {
 
@@ -6,34 +7,11 @@ namespace {
 
 constexpr std::uint32_t kNullText = 0xFFFFFFFFu;
 
-// Bytes of a value type that crosses as raw bytes; 0 for every other type.
-std::uint32_t FixedSize(VARTYPE vt) {
-    switch (vt) {
-    case VT_I1:
-    case VT_UI1: return 1;
-    case VT_I2:
-    case VT_UI2:
-    case VT_BOOL: return 2;
-    case VT_I4:
-    case VT_UI4:
-    case VT_INT:
-    case VT_UINT:
-    case VT_R4:
-    case VT_ERROR: return 4;
-    case VT_I8:
-    case VT_UI8:
-    case VT_R8:
-    case VT_CY:
-    case VT_DATE: return 8;
-    default: return 0;
-    }
-}
-
 bool IsObject(VARTYPE vt) { return vt == VT_DISPATCH || vt == VT_UNKNOWN; }
 
 // Fewest bytes one array element of this type takes on the wire; 0 = not allowed.
 std::uint32_t MinWireSize(VARTYPE vt) {
-    if (const std::uint32_t size = FixedSize(vt)) return size;
+    if (const std::uint32_t size = FixedValueSize(vt)) return size;
     if (vt == VT_BSTR) return 4;
     if (IsObject(vt)) return 8;
     if (vt == VT_VARIANT) return 2;
@@ -54,7 +32,7 @@ bool Dereference(const VARIANT& v, VARIANT* plain) {
         plain->parray = *v.pparray;
         return true;
     }
-    if (const std::uint32_t size = FixedSize(type)) {
+    if (const std::uint32_t size = FixedValueSize(type)) {
         std::memcpy(&plain->llVal, v.byref, size);
         return true;
     }
@@ -89,7 +67,7 @@ HRESULT WriteArray(Writer& w, VARTYPE element, const SAFEARRAY* array, IObjectMa
     w.I32(array->lLbound);
     w.U32(array->cElements);
     const auto* data = static_cast<const std::uint8_t*>(array->pvData);
-    if (const std::uint32_t size = FixedSize(element)) {
+    if (const std::uint32_t size = FixedValueSize(element)) {
         if (array->cbElements != size) return DISP_E_BADVARTYPE;
         w.Raw(data, static_cast<size_t>(size) * array->cElements);
         return S_OK;
@@ -121,7 +99,7 @@ bool ReadArray(Reader& r, VARTYPE element, SAFEARRAY** out, IObjectMarshal& mars
     if (!array) return false;
     auto* data = static_cast<std::uint8_t*>(array->pvData);
     bool ok = true;
-    if (const std::uint32_t size = FixedSize(element)) {
+    if (const std::uint32_t size = FixedValueSize(element)) {
         ok = r.Raw(data, static_cast<size_t>(size) * count);
     } else {
         for (std::uint32_t i = 0; ok && i < count; ++i) {
@@ -191,7 +169,7 @@ HRESULT WriteVariant(Writer& w, const VARIANT& v, IObjectMarshal& marshal, bool 
         w.U16(v.vt);
         return S_OK;
     }
-    if (const std::uint32_t size = FixedSize(type)) {
+    if (const std::uint32_t size = FixedValueSize(type)) {
         w.U16(v.vt);
         w.Raw(&v.llVal, size);
         return S_OK;
@@ -225,7 +203,7 @@ bool ReadVariant(Reader& r, VARIANT* out, IObjectMarshal& marshal, int depth) {
         out->vt = vt;
         return true;
     }
-    if (const std::uint32_t size = FixedSize(type)) {
+    if (const std::uint32_t size = FixedValueSize(type)) {
         out->llVal = 0;
         if (!r.Raw(&out->llVal, size)) return false;
         out->vt = vt;
