@@ -9,10 +9,12 @@ DWORD GetTickCount();
 ULONGLONG GetTickCount64();
 void Sleep(DWORD milliseconds);
 
-// Where both tick counts come from. Tests install a clock they move by hand,
-// so schedules and deadlines run without waiting; null restores the
-// monotonic clock. Sleep always sleeps.
+// Where both tick counts come from, and what Sleep does. Tests install a
+// clock they move by hand, so schedules and deadlines run without waiting;
+// a sleep hook lets a polling wait see that clock instead of the real one.
+// Null restores the monotonic clock and a real sleep.
 using TickSource = ULONGLONG (*)();
-void SetTickSource(TickSource source);
+using SleepHook = void (*)(DWORD milliseconds);
+void SetTickSource(TickSource source, SleepHook sleep = nullptr);
 DWORD GetCurrentThreadId();
 DWORD GetCurrentProcessId();

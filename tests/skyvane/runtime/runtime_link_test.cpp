@@ -13,6 +13,7 @@
 #include "temp_folder.h"
 
 #include "BulkArrays.h"
+#include "ManualTicks.h"
 
 #include <gtest/gtest.h>
 
@@ -475,6 +476,7 @@ TEST(PerProjectQueue, LimitZeroHasNoBoundAndNullValuesArriveEmpty) {
 }
 
 TEST_P(RuntimeLink, DeactivationDiscardsAndStopsThenActivationResubscribes) {
+    CManualTicks ticks(CManualTicks::Sleeps::StandStill);  // the handler waits for our tick, however long
     runtime->SetDelivery(Delivery::OwnThread);
     MakeManager();
     ASSERT_EQ(Subscribe({u"Plant#Level", u"Plant#Tank#Level", u"Plant#Flow"}), 3);
@@ -484,10 +486,9 @@ TEST_P(RuntimeLink, DeactivationDiscardsAndStopsThenActivationResubscribes) {
     runtime->Flush();
     ASSERT_EQ(Project(u"Plant")->GetQueuedCount(), 1);
 
-    ASSERT_TRUE(runtime->SetProjectActive(u"Plant", false));  // its handler waits for our tick
-    const ULONGLONG end = GetTickCount64() + 3000;
-    while (Project(u"Plant")->GetPendingCommand() != CXOnlVarsPerProject::kDeactivate && GetTickCount64() < end)
-        Sleep(1);
+    ASSERT_TRUE(runtime->SetProjectActive(u"Plant", false));
+    ASSERT_TRUE(
+        ticks.WaitUntil([&] { return Project(u"Plant")->GetPendingCommand() == CXOnlVarsPerProject::kDeactivate; }));
     manager->ProcessPending();
     runtime->Flush();
     ASSERT_EQ(target.deactivated.size(), 1u);
@@ -510,19 +511,22 @@ TEST_P(RuntimeLink, DeactivationDiscardsAndStopsThenActivationResubscribes) {
 }
 
 TEST_P(RuntimeLink, ActiveOnAnotherThreadWaitsForThePendingInactive) {
+    CManualTicks ticks(CManualTicks::Sleeps::StandStill);  // both handlers wait as long as it takes
     MakeManager();
     ASSERT_EQ(Subscribe({u"Plant#Level"}), 1);
     ASSERT_TRUE(manager->Start());
     CXOnlVarsPerProject* plant = Project(u"Plant");
     std::thread inactive([&] { plant->OnProjectInactive(); });
-    const ULONGLONG end = GetTickCount64() + 1500;
-    while (plant->GetPendingCommand() != CXOnlVarsPerProject::kDeactivate && GetTickCount64() < end) Sleep(1);
+    ASSERT_TRUE(ticks.WaitUntil([&] { return plant->GetPendingCommand() == CXOnlVarsPerProject::kDeactivate; }));
+    std::atomic<DWORD> activeThread{0};
     std::atomic<bool> activeDone{false};
     std::thread active([&] {
+        activeThread = GetCurrentThreadId();
         plant->OnProjectActive();
         activeDone = true;
     });
-    Sleep(120);  // the "Active" handler is polling now
+    // Once the "Active" handler has slept it is polling the full mailbox.
+    EXPECT_TRUE(ticks.WaitUntil([&] { return activeThread != 0 && ticks.HasSlept(activeThread); }));
     EXPECT_FALSE(activeDone);
     manager->ProcessPending();  // runs command 1
     inactive.join();
@@ -536,12 +540,14 @@ TEST_P(RuntimeLink, ActiveOnAnotherThreadWaitsForThePendingInactive) {
 }
 
 TEST_P(RuntimeLink, InactiveOnTheTimerThreadFailsAtTheDeadline) {
-    MakeManager(200);  // caller-thread delivery: the event arrives on the "timer" thread
+    CManualTicks ticks(CManualTicks::Sleeps::MoveTheClock);  // its polls are all the time that passes
+    MakeManager(230);  // caller-thread delivery: the event arrives on the "timer" thread
     ASSERT_EQ(Subscribe({u"Plant#Level"}), 1);
     ASSERT_TRUE(manager->Start());
-    const ULONGLONG start = GetTickCount64();
+    const ULONGLONG start = ticks.Now();
     ASSERT_TRUE(runtime->SetProjectActive(u"Plant", false));
-    EXPECT_GE(GetTickCount64() - start, 150u);
+    EXPECT_GE(ticks.Now() - start, 230u) << "not before the deadline";
+    EXPECT_LT(ticks.Now() - start, 230u + 50u) << "within one poll after it";
     EXPECT_EQ(target.inactiveFailed, (std::vector<CString>{u"Plant"}));
     manager->ProcessPending();  // the stored command still runs
     EXPECT_EQ(target.deactivated.size(), 1u);
