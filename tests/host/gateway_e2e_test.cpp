@@ -24,6 +24,11 @@ struct Target {
 const char* const kVariables[] = {"Plant#Tank1.Level", "Plant#Pump1.Speed", "Plant#Pump1.State",
                                   "Utilities#Water.Flow"};
 
+// The line of a start attempt, the first or a later one, that got the module running.
+bool ModuleRuns(const std::string& line) {
+    return line.find("start attempt") != std::string::npos && line.find("the module runs") != std::string::npos;
+}
+
 class GatewayEndToEnd : public ::testing::Test {
 protected:
     void SetUp() override {
@@ -82,9 +87,14 @@ protected:
         return clock.elapsed();
     }
 
-    std::string LastLogLine() {
+    // Stopped by the signal while values flow, the gateway ends with 0 within 2 s, its log written out.
+    void ExpectQuickCleanStop(GatewayProcess& gateway, int signal) {
+        const qint64 stopMs = StopWith(gateway, signal);
+        EXPECT_GE(stopMs, 0);
+        EXPECT_LT(stopMs, 2000) << "a stop during steady sending ends the gateway within 2 s";
         const auto lines = TempFolder::ReadLines(m_logFile);
-        return lines.empty() ? std::string() : lines.back();
+        const std::string last = lines.empty() ? std::string() : lines.back();
+        EXPECT_NE(last.find("Log stopped"), std::string::npos) << "the log is written out: " << last;
     }
 
     TempFolder m_folder;
@@ -99,15 +109,12 @@ TEST_F(GatewayEndToEnd, RowsReachBothTargetsInTheirFormatsAndTheStatusLinesCount
     ASSERT_NE(gateway->WaitForText("start attempt 1: the module runs"), "") << gateway->Errors();
     ASSERT_NE(gateway->WaitForLine(IsStatusWithRows), "");
 
-    const qint64 stopMs = StopWith(*gateway, SIGTERM);
-    EXPECT_GE(stopMs, 0);
-    EXPECT_LT(stopMs, 2000) << "SIGTERM during steady sending ends the gateway within 2 s";
-    EXPECT_NE(LastLogLine().find("Log stopped"), std::string::npos) << "the log is written out: " << LastLogLine();
+    ExpectQuickCleanStop(*gateway, SIGTERM);
 
     std::map<std::string, std::set<std::string>> formats;
-    const auto rows = RowsPerEntity(&formats);
-    EXPECT_GT(rows.count("values") ? rows.at("values") : 0, 0u);
-    EXPECT_GT(rows.count("plant-hub") ? rows.at("plant-hub") : 0, 0u);
+    auto rows = RowsPerEntity(&formats);
+    EXPECT_GT(rows["values"], 0u);
+    EXPECT_GT(rows["plant-hub"], 0u);
     EXPECT_EQ(formats["values"], (std::set<std::string>{"JSON"}));
     EXPECT_EQ(formats["plant-hub"], (std::set<std::string>{"BOND"}));
     // Every row the module reported as sent arrived, and nothing else.
@@ -120,11 +127,8 @@ TEST_F(GatewayEndToEnd, RowsReachBothTargetsInTheirFormatsAndTheStatusLinesCount
 TEST_F(GatewayEndToEnd, SigintEndsItLikeSigterm) {
     auto gateway = StartGateway(WriteSettings({{"values", false, 0}}));
     ASSERT_NE(gateway->WaitForLine(IsStatusWithRows), "") << gateway->Errors();
-    const qint64 stopMs = StopWith(*gateway, SIGINT);
-    EXPECT_GE(stopMs, 0);
-    EXPECT_LT(stopMs, 2000);
+    ExpectQuickCleanStop(*gateway, SIGINT);
     EXPECT_NE(gateway->WaitForText("stopping: SIGINT"), "");
-    EXPECT_NE(LastLogLine().find("Log stopped"), std::string::npos) << LastLogLine();
     EXPECT_GT(RowsPerEntity()["values"], 0u);
 }
 
@@ -145,7 +149,7 @@ TEST_F(GatewayEndToEnd, SighupBringsANewTargetAndReportsAnUnknownVariableWithout
     gateway->Signal(SIGHUP);
     EXPECT_NE(gateway->WaitForText("could not restart the export (message 1126)"), "");
     EXPECT_NE(gateway->WaitForText("start attempt 2 failed: the module could not start"), "");
-    EXPECT_EQ(StopWith(*gateway, SIGTERM) >= 0, true) << "still running, and stops cleanly";
+    EXPECT_GE(StopWith(*gateway, SIGTERM), 0) << "still running, and stops cleanly";
     const std::string errors = gateway->Errors();
     EXPECT_NE(errors.find("Variable is unknown:"), std::string::npos) << errors;
     EXPECT_NE(errors.find("Plant#NoSuchVariable"), std::string::npos) << errors;
@@ -156,10 +160,7 @@ TEST_F(GatewayEndToEnd, StartedBeforeTheRuntimeItKeepsTryingAndThenSends) {
     auto gateway = StartGateway(WriteSettings({{"values", false, 1}}), {"--simulate-delay", "2"});
     EXPECT_NE(gateway->WaitForText("start attempt 1 failed: no SCADA runtime is reachable"), "") << gateway->Errors();
     EXPECT_NE(gateway->WaitForText("the runtime stand-in runs"), "");
-    EXPECT_NE(gateway->WaitForLine([](const std::string& line) {
-        return line.find("start attempt") != std::string::npos && line.find("the module runs") != std::string::npos;
-    }),
-              "");
+    EXPECT_NE(gateway->WaitForLine(ModuleRuns), "");
     ASSERT_NE(gateway->WaitForLine(IsStatusWithRows), "");
     EXPECT_GE(StopWith(*gateway, SIGTERM), 0);
     EXPECT_GT(RowsPerEntity()["values"], 0u);
@@ -171,12 +172,9 @@ TEST_F(GatewayEndToEnd, FollowsARuntimeInAnotherProcessThatStartsLaterAndIsKille
     GatewayProcess gateway({"run", "--ini", WriteSettings({{"values", false, 1}}), "--status-interval", "0.5"},
                            m_environment);
     ASSERT_NE(gateway.WaitForText("start attempt 1 failed: no SCADA runtime is reachable"), "") << gateway.Errors();
-    const auto runs = [](const std::string& line) {
-        return line.find("start attempt") != std::string::npos && line.find("the module runs") != std::string::npos;
-    };
     RuntimeProcess runtime;
     ASSERT_TRUE(runtime.Start(Project(), sockets));
-    EXPECT_NE(gateway.WaitForLine(runs), "");
+    EXPECT_NE(gateway.WaitForLine(ModuleRuns), "");
     ASSERT_NE(gateway.WaitForLine(IsStatusWithRows), "");
 
     // Killed while values flow: the gateway keeps running, says so, and
@@ -184,7 +182,7 @@ TEST_F(GatewayEndToEnd, FollowsARuntimeInAnotherProcessThatStartsLaterAndIsKille
     runtime.Kill(SIGKILL);
     ASSERT_NE(gateway.WaitForText("the SCADA runtime went away"), "") << gateway.Errors();
     ASSERT_TRUE(runtime.Start(Project(), sockets));
-    EXPECT_NE(gateway.WaitForLine(runs, 45000), "");
+    EXPECT_NE(gateway.WaitForLine(ModuleRuns, 45000), "");
     const size_t before = RowsPerEntity()["values"];
     ASSERT_NE(gateway.WaitForLine(IsStatusWithRows), "");
     EXPECT_GE(StopWith(gateway, SIGTERM), 0);

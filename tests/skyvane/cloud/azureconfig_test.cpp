@@ -21,8 +21,6 @@ void Fill(CAzureConfig& config) {
     for (LPCWSTR queue : {u"telemetry", u"values"}) {
         auto* connection = new CConnection;
         connection->m_strQueue = queue;
-        connection->m_bEventHub = config.m_lstConnections.GetCount() == 1;
-        connection->m_nFormat = 7;
         config.m_lstConnections.AddTail(connection);
     }
     config.m_nIntegrityPeriod = 30;
@@ -31,7 +29,6 @@ void Fill(CAzureConfig& config) {
 
 TEST(AzureConfig, CopiesShareNothing) {
     CAzureConfig source;
-    EXPECT_EQ(source.m_nIntegrityPeriod, 5);
     Fill(source);
     EXPECT_EQ(source.m_mapVariables.GetCount(), 3);  // keys differing in case are two entries
 
@@ -47,8 +44,6 @@ TEST(AzureConfig, CopiesShareNothing) {
     ASSERT_EQ(copy.m_lstConnections.GetCount(), 2);
     EXPECT_NE(copy.m_lstConnections.GetHead(), source.m_lstConnections.GetHead());
     EXPECT_EQ(copy.m_lstConnections.GetHead()->m_strQueue, u"telemetry");  // list order kept
-    EXPECT_TRUE(copy.m_lstConnections.GetTail()->m_bEventHub);
-    EXPECT_EQ(copy.m_lstConnections.GetTail()->m_nFormat, 7);
     EXPECT_EQ(copy.m_nIntegrityPeriod, 30);
     EXPECT_EQ(copy.m_strProxyPassword, u"A1B2");
 

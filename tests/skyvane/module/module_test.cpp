@@ -50,6 +50,12 @@ protected:
         ASSERT_TRUE(runtime->Start(&error)) << error;
     }
 
+    // The common set-up: a runtime with Plant#Level, exported to the JSON target "values".
+    void StartPlantLevel() {
+        StartRuntime({Project(u"Plant", {u"Level"})});
+        WriteSettingsFile(SettingsPath(), {{"Plant#Level"}, {Target("values", 1)}});
+    }
+
     TargetSettings Target(const std::string& queue, int format, bool eventHub = false) const {
         return {receiver->ConnectionString(), queue, eventHub, format};
     }
@@ -161,13 +167,11 @@ TEST_F(ModuleTest, UnknownVariablesAreListedLastFirstUnderTheirHeading) {
     const auto texts = boxes.Texts();
     ASSERT_EQ(texts.size(), 3u);
     EXPECT_EQ(texts[0], "Variable is unknown:\nPlant#Missing10");
-    std::string ten = "The listed variables are unknown:\n";
-    for (int i = 19; i >= 10; --i) ten += "Plant#Missing" + std::to_string(i) + (i > 10 ? ", " : "");
-    EXPECT_EQ(texts[1], ten);
     // Map order puts Missing10..Missing20 in key order; the first ten refused are shown, the last first.
-    std::string many = "Many variables are unknown, some are listed:\n";
-    for (int i = 19; i >= 10; --i) many += "Plant#Missing" + std::to_string(i) + (i > 10 ? ", " : "");
-    EXPECT_EQ(texts[2], many);
+    std::string tenListed;
+    for (int i = 19; i >= 10; --i) tenListed += "Plant#Missing" + std::to_string(i) + (i > 10 ? ", " : "");
+    EXPECT_EQ(texts[1], "The listed variables are unknown:\n" + tenListed);
+    EXPECT_EQ(texts[2], "Many variables are unknown, some are listed:\n" + tenListed);
 }
 
 TEST_F(ModuleTest, ALinkThatCannotStartOrNoRuntimeShowsTheConnectionFailure) {
@@ -227,8 +231,7 @@ TEST_F(ModuleTest, ExecActionAppliesNewSettingsAndReportsAFailedRestart) {
 }
 
 TEST_F(ModuleTest, DllExitEndsTheExportAndInitWorksAgain) {
-    StartRuntime({Project(u"Plant", {u"Level"})});
-    WriteSettingsFile(SettingsPath(), {{"Plant#Level"}, {Target("values", 1)}});
+    StartPlantLevel();
     ASSERT_EQ(module.Init(&context), 1);
     EXPECT_EQ(module.DllExit(), 1);
     VX_PumpMessages(100);  // what the worker posted before it ended
@@ -246,8 +249,7 @@ TEST_F(ModuleTest, DllExitEndsTheExportAndInitWorksAgain) {
 }
 
 TEST_F(ModuleTest, ARetriedSendLosesNothingAndRefusedRowsAreReportedWithTheKeyMasked) {
-    StartRuntime({Project(u"Plant", {u"Level"})});
-    WriteSettingsFile(SettingsPath(), {{"Plant#Level"}, {Target("values", 1)}});
+    StartPlantLevel();
     ASSERT_EQ(module.Init(&context), 1);
 
     ASSERT_TRUE(receiver->Fault("kind=status&status=503&count=1&retry-after-ms=100"));
@@ -288,8 +290,7 @@ TEST_F(ModuleTest, EveryTargetGetsTheSameRowsAndTheStatusCountsThemAll) {
 }
 
 TEST_F(ModuleTest, ExportsCalledOnAnotherThreadRunOnTheWindowsThread) {
-    StartRuntime({Project(u"Plant", {u"Level"})});
-    WriteSettingsFile(SettingsPath(), {{"Plant#Level"}, {Target("values", 1)}});
+    StartPlantLevel();
     std::atomic<int> result{-1};
     std::thread caller([&] { result = module.Init(&context); });
     ASSERT_TRUE(PumpUntil([&] { return result.load() != -1; }));  // the window's thread carries it out
@@ -305,8 +306,7 @@ TEST_F(ModuleTest, ExportsCalledOnAnotherThreadRunOnTheWindowsThread) {
 }
 
 TEST_F(ModuleTest, ACheckRequestedWhileAMessageBoxIsOpenRunsWhenItCloses) {
-    StartRuntime({Project(u"Plant", {u"Level"})});
-    WriteSettingsFile(SettingsPath(), {{"Plant#Level"}, {Target("values", 1)}});
+    StartPlantLevel();
     runtime->SetRaiseError(tarvo::ObjectKind::Variables, tarvo::dispid::CollectionItem);  // the lookup fails
     CMessageBoxRecorder boxes;
     // While the box is open the runtime recovers and the project becomes
@@ -329,8 +329,7 @@ TEST_F(ModuleTest, ACheckRequestedWhileAMessageBoxIsOpenRunsWhenItCloses) {
 }
 
 TEST_F(ModuleTest, KonfigWithoutADesktopSaysSoAndChangesNothing) {
-    StartRuntime({Project(u"Plant", {u"Level"})});
-    WriteSettingsFile(SettingsPath(), {{"Plant#Level"}, {Target("values", 1)}});
+    StartPlantLevel();
     const std::string before = TempFolder::Read(SettingsPath());
     CMessageBoxRecorder boxes;
     EXPECT_EQ(module.Konfig(&context), 0);  // before init: nothing to configure

@@ -14,7 +14,6 @@
 #include <QApplication>
 #include <QComboBox>
 #include <QLineEdit>
-#include <QPushButton>
 #include <QRadioButton>
 #include <QTest>
 #include <QTreeWidget>
@@ -30,25 +29,7 @@ std::vector<std::string> Texts(QTreeWidget* list, int column = 0) {
     return texts;
 }
 
-template <typename T = QWidget>
-T* Control(QWidget& dialog, UINT id) {
-    T* control = dialog.findChild<T*>(QString::number(id));
-    EXPECT_NE(control, nullptr) << "control " << id;
-    return control;
-}
-
 QTreeWidget* List(QWidget& dialog, UINT id) { return Control<QTreeWidget>(dialog, id); }
-
-void Click(QWidget& dialog, UINT id) { QTest::mouseClick(Control<QPushButton>(dialog, id), Qt::LeftButton); }
-
-void SelectRows(QTreeWidget* list, const std::vector<std::string>& texts) {
-    list->clearSelection();
-    for (const std::string& text : texts) {
-        const auto found = list->findItems(QString::fromStdString(text), Qt::MatchExactly);
-        ASSERT_EQ(found.size(), 1) << text;
-        found.front()->setSelected(true);
-    }
-}
 
 void ClickHeader(QTreeWidget* list) {
     QHeaderView* header = list->header();

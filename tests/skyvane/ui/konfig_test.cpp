@@ -8,9 +8,6 @@
 #include "res/resource.h"
 
 #include <QLineEdit>
-#include <QPushButton>
-#include <QTest>
-#include <QTreeWidget>
 
 #include <gtest/gtest.h>
 
@@ -19,23 +16,6 @@
 namespace {
 
 using azurelocal::AzureLocalProcess;
-
-template <typename T = QWidget>
-T* Control(QWidget& dialog, UINT id) {
-    T* control = dialog.findChild<T*>(QString::number(id));
-    EXPECT_NE(control, nullptr) << "control " << id;
-    return control;
-}
-
-void Click(QWidget& dialog, UINT id) { QTest::mouseClick(Control<QPushButton>(dialog, id), Qt::LeftButton); }
-
-void Select(QWidget& dialog, UINT list, const char* text) {
-    auto* widget = Control<QTreeWidget>(dialog, list);
-    widget->clearSelection();
-    const auto found = widget->findItems(text, Qt::MatchExactly);
-    ASSERT_EQ(found.size(), 1) << text;
-    found.front()->setSelected(true);
-}
 
 class KonfigTest : public ::testing::Test {
 protected:
@@ -75,8 +55,8 @@ protected:
 
     // Adds Flow to the exported variables and a target "added" in the open settings dialog.
     void AddFlowAndTarget(QDialog& settings) {
-        Select(settings, IDC_LIST_PROJECTS, "Plant");
-        Select(settings, IDC_LIST_VARIABLES, "Flow");
+        SelectRows(Control<QTreeWidget>(settings, IDC_LIST_PROJECTS), {"Plant"});
+        SelectRows(Control<QTreeWidget>(settings, IDC_LIST_VARIABLES), {"Flow"});
         Click(settings, IDC_ADD_VARIABLES);
         const QString connection = QString::fromStdString(receiver->ConnectionString());
         driver.OnNextDialog("2000", [connection](QDialog& target) {
