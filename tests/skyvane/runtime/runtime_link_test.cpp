@@ -139,6 +139,8 @@ public:
     virtual size_t ProjectSinks(const std::u16string& project) = 0;
     // Stops the runtime: every object the link holds fails from then on.
     virtual void Stop() = 0;
+    // Ends the runtime and starts a new one, as a restart on the plant would.
+    virtual bool Restart() = 0;
     // Checks that the link gave every runtime object back.
     virtual void ExpectNoObjectsLeft() = 0;
 };
@@ -178,16 +180,19 @@ protected:
 
 class InProcessRuntime final : public DriverOf<tarvo::Runtime> {
 public:
-    InProcessRuntime() {
+    InProcessRuntime() { started = Restart(); }
+    void Stop() override { m_runtime->Stop(); }
+    bool Restart() override {
+        m_runtime.reset();
         tarvo::RuntimeOptions options;
         options.delivery = Delivery::CallerThread;
         options.simulate = false;
         m_runtime = std::make_unique<tarvo::Runtime>(PlantConfig(), options);
         std::string error;
-        started = m_runtime->Start(&error);
-        EXPECT_TRUE(started) << error;
+        const bool ok = m_runtime->Start(&error);
+        EXPECT_TRUE(ok) << error;
+        return ok;
     }
-    void Stop() override { m_runtime->Stop(); }
     void ExpectNoObjectsLeft() override {
         m_runtime.reset();
         EXPECT_EQ(tarvo::Runtime::LiveObjects(), 0) << "automation objects leaked";
@@ -239,9 +244,10 @@ public:
                       << m_process.Output();
         return false;
     }
-    void Kill() {
+    bool Restart() override {
         m_control.reset();
         m_process.Kill(SIGKILL);
+        return Launch();
     }
     void Stop() override {
         m_control.reset();
@@ -258,7 +264,6 @@ public:
         application.Release();
         EXPECT_EQ(m_control->LiveObjects(), 1) << "automation objects leaked";
     }
-    tarvo::RemoteControl& Control() { return *m_control; }
     bool started = false;
 
 protected:
@@ -695,41 +700,17 @@ public:
 };
 }  // namespace
 
-TEST(ProjectWatcher, FollowsARestartedRuntimeAfterAFailedUnadvise) {
-    tarvo::RuntimeOptions options;
-    options.delivery = Delivery::CallerThread;
-    options.simulate = false;
-    CountingProjectTarget target;
-    auto watcher = VX_CreateCounted<COnlProject>(&target);
-    {
-        tarvo::Runtime first(PlantConfig(), options);
-        ASSERT_TRUE(first.Start());
-        ASSERT_TRUE(watcher->Attach(u"Plant"));
-    }  // gone: unadvising at the old runtime can only fail now
-    tarvo::Runtime second(PlantConfig(), options);
-    ASSERT_TRUE(second.Start());
-    ASSERT_TRUE(watcher->Attach(u"Plant"));  // must advise anew, not keep the dead cookie
-    EXPECT_EQ(second.ProjectSinks(u"Plant"), 1u);
-    second.SetProjectActive(u"Plant", false);
-    EXPECT_EQ(target.inactive, 1);
-    watcher.Reset();
-    EXPECT_EQ(second.ProjectSinks(u"Plant"), 0u);
-}
-
-TEST(ProjectWatcher, FollowsARuntimeProcessKilledAndStartedAgain) {
-    CountingProjectTarget target;
-    auto watcher = VX_CreateCounted<COnlProject>(&target);
-    SocketRuntime runtime;
-    ASSERT_TRUE(runtime.started);
+TEST_P(RuntimeLink, ProjectWatcherFollowsARestartedRuntimeAfterAFailedUnadvise) {
+    CountingProjectTarget projectTarget;
+    auto watcher = VX_CreateCounted<COnlProject>(&projectTarget);
     ASSERT_TRUE(watcher->Attach(u"Plant"));
-    runtime.Kill();
-    ASSERT_TRUE(runtime.Launch());
-    ASSERT_TRUE(watcher->Attach(u"Plant"));  // a fresh connection, a fresh advise
-    EXPECT_EQ(runtime.Control().ProjectSinks(u"Plant"), 1u);
-    runtime.Control().SetProjectActive(u"Plant", false);  // delivered before the call returns
-    EXPECT_EQ(target.inactive, 1);
+    ASSERT_TRUE(runtime->Restart());         // gone: unadvising at the old runtime can only fail now
+    ASSERT_TRUE(watcher->Attach(u"Plant"));  // must advise anew, not keep the dead cookie
+    EXPECT_EQ(runtime->ProjectSinks(u"Plant"), 1u);
+    runtime->SetProjectActive(u"Plant", false);  // delivered before the call returns
+    EXPECT_EQ(projectTarget.inactive, 1);
     watcher.Reset();
-    EXPECT_EQ(runtime.Control().ProjectSinks(u"Plant"), 0u);
+    EXPECT_EQ(runtime->ProjectSinks(u"Plant"), 0u);
 }
 
 namespace {
