@@ -24,6 +24,8 @@ void Fill(CAzureConfig& config) {
         config.m_lstConnections.AddTail(connection);
     }
     config.m_nIntegrityPeriod = 30;
+    config.m_strProxyDomain = u"proxy:3128";
+    config.m_strProxyUser = u"CORP\\user";
     config.m_strProxyPassword = u"A1B2";
 }
 
@@ -45,6 +47,8 @@ TEST(AzureConfig, CopiesShareNothing) {
     EXPECT_NE(copy.m_lstConnections.GetHead(), source.m_lstConnections.GetHead());
     EXPECT_EQ(copy.m_lstConnections.GetHead()->m_strQueue, u"telemetry");  // list order kept
     EXPECT_EQ(copy.m_nIntegrityPeriod, 30);
+    EXPECT_EQ(copy.m_strProxyDomain, u"proxy:3128");
+    EXPECT_EQ(copy.m_strProxyUser, u"CORP\\user");
     EXPECT_EQ(copy.m_strProxyPassword, u"A1B2");
 
     // Editing and dropping the copy leaves the source as it was.
