@@ -153,6 +153,15 @@ protected:
     CComPtr<CEcho> echo = MakeComObject<CEcho>();
 };
 
+// A frame on the wire: its length in four bytes, then the payload.
+std::vector<std::uint8_t> Framed(const std::vector<std::uint8_t>& payload) {
+    const auto length = static_cast<std::uint32_t>(payload.size());
+    std::vector<std::uint8_t> bytes(reinterpret_cast<const std::uint8_t*>(&length),
+                                    reinterpret_cast<const std::uint8_t*>(&length) + 4);
+    bytes.insert(bytes.end(), payload.begin(), payload.end());
+    return bytes;
+}
+
 // A raw client that speaks bytes, not the protocol.
 class RawClient {
 public:
@@ -164,12 +173,8 @@ public:
         connected = ::connect(m_fd, reinterpret_cast<sockaddr*>(&address), sizeof address) == 0;
     }
     ~RawClient() { ::close(m_fd); }
-    void Send(const void* data, size_t size) { (void)!::send(m_fd, data, size, MSG_NOSIGNAL); }
-    void SendFrame(const std::vector<std::uint8_t>& payload) {
-        const auto length = static_cast<std::uint32_t>(payload.size());
-        Send(&length, 4);
-        Send(payload.data(), payload.size());
-    }
+    void Send(const std::vector<std::uint8_t>& bytes) { (void)!::send(m_fd, bytes.data(), bytes.size(), MSG_NOSIGNAL); }
+    void SendFrame(const std::vector<std::uint8_t>& payload) { Send(Framed(payload)); }
     void SendHello() {
         std::vector<std::uint8_t> hello{1, 0x53, 0x4B, 0x41, 0x55, 1, 0};
         SendFrame(hello);
@@ -389,45 +394,35 @@ TEST_F(LocalSocket, LostServerFailsEveryCallAndANewOneIsFound) {
 TEST_F(LocalSocket, MalformedOrTruncatedFramesCloseOnlyThatConnection) {
     CComPtr<IDispatch> object = Find();
     ASSERT_TRUE(object);
-    const std::uint32_t tooLarge = 0x7FFFFFFF;
-    const std::vector<std::vector<std::uint8_t>> garbage = {
-        {9, 9, 9},                                                               // unknown kind
-        {2, 1, 0, 0, 0, 3, 1, 0, 0, 0, 0, 0, 0, 0},                              // a call cut short inside its fields
-        {4, 99, 0, 0, 0, 0, 0, 0, 0},                                            // release of an object never exported
-        {3, 1, 0},                                                               // a reply too short for its status
-        InvokeFrame(1, 1, {0x05, 0x20, 1, 0, 0, 0, 0, 0xFF, 0xFF, 0xFF, 0x7F}),  // an array larger than the frame
-        InvokeFrame(1, 1, {0x08, 0, 0xFE, 0xFF, 0xFF, 0x7F}),                    // a text larger than the frame
-        InvokeFrame(1, 1, {0xFF, 0x0F}),                                         // a type that does not exist
-        InvokeFrame(1, 65, {}),                                                  // more arguments than allowed
-        InvokeFrame(1, 1, {0x03, 0x40, 0x08, 0, 0, 0, 0, 0}),  // a reference to I4 whose target is a text
-        InvokeFrame(1, 1, {0x0C, 0x40, 0x0C, 0x40, 0, 0}),     // a reference inside a reference
-        InvokeFrame(1, 0, {0}),                                // bytes after the last field
+    // What each client sends after its greeting (if it greets).
+    const struct Case {
+        const char* name;
+        std::vector<std::uint8_t> bytes;
+        bool hello = true;
+    } cases[] = {
+        {"unknown kind", Framed({9, 9, 9})},
+        {"a call cut short inside its fields", Framed({2, 1, 0, 0, 0, 3, 1, 0, 0, 0, 0, 0, 0, 0})},
+        {"release of an object never exported", Framed({4, 99, 0, 0, 0, 0, 0, 0, 0})},
+        {"a reply too short for its status", Framed({3, 1, 0})},
+        {"an array larger than the frame",
+         Framed(InvokeFrame(1, 1, {0x05, 0x20, 1, 0, 0, 0, 0, 0xFF, 0xFF, 0xFF, 0x7F}))},
+        {"a text larger than the frame", Framed(InvokeFrame(1, 1, {0x08, 0, 0xFE, 0xFF, 0xFF, 0x7F}))},
+        {"a type that does not exist", Framed(InvokeFrame(1, 1, {0xFF, 0x0F}))},
+        {"more arguments than allowed", Framed(InvokeFrame(1, 65, {}))},
+        {"a reference to I4 whose target is a text", Framed(InvokeFrame(1, 1, {0x03, 0x40, 0x08, 0, 0, 0, 0, 0}))},
+        {"a reference inside a reference", Framed(InvokeFrame(1, 1, {0x0C, 0x40, 0x0C, 0x40, 0, 0}))},
+        {"bytes after the last field", Framed(InvokeFrame(1, 0, {0}))},
+        {"no greeting first", Framed({2, 1, 0, 0, 0, 1}), false},
+        {"a length too large", {0xFF, 0xFF, 0xFF, 0x7F}},
+        // Closed after the frame time-out.
+        {"a frame that starts and never ends", {100, 0, 0, 0, 'a', 'b', 'c', 'd', 'e', 'f', 'g', 'h', 'i', 'j'}},
     };
-    for (const auto& payload : garbage) {
+    for (const Case& c : cases) {
         RawClient raw(SocketPath());
         ASSERT_TRUE(raw.connected);
-        raw.SendHello();
-        raw.SendFrame(payload);
-        EXPECT_TRUE(raw.ClosedByServer()) << "kind " << int(payload[0]);
-    }
-    {
-        RawClient raw(SocketPath());  // no greeting first
-        raw.SendFrame({2, 1, 0, 0, 0, 1});
-        EXPECT_TRUE(raw.ClosedByServer());
-    }
-    {
-        RawClient raw(SocketPath());
-        raw.SendHello();
-        raw.Send(&tooLarge, 4);
-        EXPECT_TRUE(raw.ClosedByServer());
-    }
-    {
-        RawClient raw(SocketPath());  // a frame that starts and never ends: closed after the frame time-out
-        raw.SendHello();
-        const std::uint32_t length = 100;
-        raw.Send(&length, 4);
-        raw.Send("abcdefghij", 10);
-        EXPECT_TRUE(raw.ClosedByServer());
+        if (c.hello) raw.SendHello();
+        raw.Send(c.bytes);
+        EXPECT_TRUE(raw.ClosedByServer()) << c.name;
     }
     {
         // A well-formed call to an object that does not exist gets an error, and the connection stays.

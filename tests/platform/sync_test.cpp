@@ -6,6 +6,18 @@
 #include <atomic>
 #include <thread>
 
+namespace {
+
+// What f returns when run on a thread of its own.
+template <typename F>
+auto OnAnotherThread(F f) {
+    decltype(f()) result{};
+    std::thread([&] { result = f(); }).join();
+    return result;
+}
+
+}  // namespace
+
 TEST(CMutexTest, RecursiveOnOneThreadExclusiveAcrossThreads) {
     CMutex mutex;
     ASSERT_TRUE(mutex.Lock(0));
@@ -24,19 +36,17 @@ TEST(CMutexTest, RecursiveOnOneThreadExclusiveAcrossThreads) {
     EXPECT_FALSE(gotWithTimeout);
     EXPECT_GE(waited, 50u);
 
+    const auto lockElsewhere = [&] {
+        return OnAnotherThread([&] {
+            const bool got = mutex.Lock(0);
+            if (got) mutex.Unlock();
+            return got;
+        });
+    };
     mutex.Unlock();
-    // Still held once: another thread must still fail.
-    std::thread second([&] { gotImmediately = mutex.Lock(0); });
-    second.join();
-    EXPECT_FALSE(gotImmediately);
-
+    EXPECT_FALSE(lockElsewhere()) << "still held once";
     mutex.Unlock();
-    std::thread third([&] {
-        gotImmediately = mutex.Lock(0);
-        if (gotImmediately) mutex.Unlock();
-    });
-    third.join();
-    EXPECT_TRUE(gotImmediately);
+    EXPECT_TRUE(lockElsewhere());
 }
 
 TEST(CMutexTest, WaitingLockSucceedsWhenReleasedInTime) {
@@ -63,13 +73,7 @@ TEST(CSingleLockTest, UnlocksOnDestructionAndOnlyOnce) {
         EXPECT_FALSE(lock.Unlock());
         EXPECT_TRUE(lock.Lock());
     }
-    bool free = false;
-    std::thread other([&] {
-        CSingleLock lock(&cs, true);
-        free = lock.IsLocked();
-    });
-    other.join();
-    EXPECT_TRUE(free);
+    EXPECT_TRUE(OnAnotherThread([&] { return CSingleLock(&cs, true).IsLocked(); }));
 }
 
 TEST(Ticks, MonotonicAndConsistent) {
@@ -79,19 +83,13 @@ TEST(Ticks, MonotonicAndConsistent) {
     EXPECT_GE(b - a, 20u);
     EXPECT_EQ(static_cast<DWORD>(GetTickCount64() - GetTickCount()) / 1000, 0u);
     EXPECT_NE(GetCurrentThreadId(), 0u);
-    DWORD otherId = 0;
-    std::thread t([&] { otherId = GetCurrentThreadId(); });
-    t.join();
-    EXPECT_NE(otherId, GetCurrentThreadId());
+    EXPECT_NE(OnAnotherThread([] { return GetCurrentThreadId(); }), GetCurrentThreadId());
 }
 
 TEST(CMutexTest, UnlockByAnotherThreadIsRefused) {
     CMutex mutex;
     ASSERT_TRUE(mutex.Lock());
-    bool unlocked = true;
-    std::thread other([&] { unlocked = mutex.Unlock(); });
-    other.join();
-    EXPECT_FALSE(unlocked);
+    EXPECT_FALSE(OnAnotherThread([&] { return mutex.Unlock(); }));
     EXPECT_TRUE(mutex.Unlock());
     EXPECT_FALSE(mutex.Unlock());
 }
