@@ -1,5 +1,18 @@
 # Sourced by the scripts that run azure-local beside the gateway (demo, soak).
 #
+# prepare_release_run TOP NAME installs what is missing, builds the release
+# flavour and sets bin (its programs) and run_folder (build/release/NAME,
+# emptied for this run).
+prepare_release_run() {
+  local top=$1 build
+  bash "$top/scripts/setup.sh"
+  build=$(bash "$top/scripts/build.sh" release | tail -n 1)
+  bin="$build/bin"
+  run_folder="$build/$2"
+  rm -rf "$run_folder"
+  mkdir -p "$run_folder"
+}
+
 # start_azure_local BIN_DIR ERROR_FILE [OPTION...] starts it as a coprocess on
 # a free port of 127.0.0.1 and sets azure_port and azure_connection (a
 # connection string with the receiver's own key, which exists only on

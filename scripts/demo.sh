@@ -17,14 +17,9 @@ while (($#)); do
 done
 [[ "$duration" =~ ^[0-9]+$ && "$duration" -gt 0 ]] || { echo "demo: --duration needs whole seconds above 0" >&2; exit 2; }
 
-bash "$top/scripts/setup.sh"
-build=$(bash "$top/scripts/build.sh" release | tail -n 1)
-bin="$build/bin"
-demo="$build/demo"
-rm -rf "$demo"
-mkdir -p "$demo"
-
 source "$top/scripts/azure-local.sh"
+prepare_release_run "$top" demo
+demo=$run_folder
 trap stop_azure_local EXIT
 start_azure_local "$bin" "$demo/azure-local.err" --record "$demo/rows.jsonl" || exit 1
 port=$azure_port

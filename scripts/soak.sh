@@ -51,12 +51,9 @@ minutes=${1:-}
   exit 2
 }
 
-bash "$top/scripts/setup.sh"
-build=$(bash "$top/scripts/build.sh" release | tail -n 1)
-bin="$build/bin"
-work="$build/soak"
-rm -rf "$work"
-mkdir -p "$work"
+source "$top/scripts/azure-local.sh"
+prepare_release_run "$top" soak
+work=$run_folder
 
 variables=10000
 rate=20000  # changes per second in all: each variable every 500 ms
@@ -68,7 +65,6 @@ jq -n --argjson variables "$variables" --argjson rate "$rate" '{
     name: "Value{n}", repeat: $variables, rate: $rate, generator: { kind: "counter" } }] }]
 }' > "$work/project.json"
 
-source "$top/scripts/azure-local.sh"
 gateway_pid=
 stop_all() {
   if [[ -n "$gateway_pid" ]]; then

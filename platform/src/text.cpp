@@ -373,6 +373,13 @@ void FormatPointer(std::u16string& out, const FormatArg& a, const Spec& spec) {
     Pad(out, digits, spec, false);
 }
 
+// A text given for a number is written as the text, never read as a number.
+bool PadIfText(std::u16string& out, const FormatArg& a, const Spec& spec) {
+    if (a.kind != FormatArg::Kind::Text16 && a.kind != FormatArg::Kind::Text8) return false;
+    Pad(out, TextOf(a), spec, false);
+    return true;
+}
+
 void FormatOne(std::u16string& out, const FormatArg& a, const Spec& spec) {
     switch (spec.conv) {
     case 's':
@@ -401,11 +408,7 @@ void FormatOne(std::u16string& out, const FormatArg& a, const Spec& spec) {
     case 'x':
     case 'X':
     case 'o':
-        if (a.kind == FormatArg::Kind::Text16 || a.kind == FormatArg::Kind::Text8) {
-            Pad(out, TextOf(a), spec, false);
-            return;
-        }
-        FormatInteger(out, a, spec);
+        if (!PadIfText(out, a, spec)) FormatInteger(out, a, spec);
         return;
     case 'e':
     case 'E':
@@ -415,11 +418,7 @@ void FormatOne(std::u16string& out, const FormatArg& a, const Spec& spec) {
     case 'G':
     case 'a':
     case 'A':
-        if (a.kind == FormatArg::Kind::Text16 || a.kind == FormatArg::Kind::Text8) {
-            Pad(out, TextOf(a), spec, false);
-            return;
-        }
-        FormatFloating(out, a, spec);
+        if (!PadIfText(out, a, spec)) FormatFloating(out, a, spec);
         return;
     case 'p': FormatPointer(out, a, spec); return;
     default: return;
